@@ -1,0 +1,136 @@
+// The host's services: thread identity, error reports, localised strings,
+// verifications, quiet errors, logging, memory statistics, tracked
+// allocation, the computer name, text conversion, the millisecond clock and
+// preferences.
+//
+// Thread safety: every function may be called from any thread. Reports are
+// written to the host log and kept for inspection (see host/control.h).
+#pragma once
+
+#include <cstddef>
+#include <cstdint>
+#include <exception>
+#include <string>
+
+#include "host/export.h"
+#include "plinth/allocator.h"
+#include "plinth/types.h"
+
+// ---------------------------------------------------------------------------
+// Threads
+// ---------------------------------------------------------------------------
+// The main thread is the process's initial thread unless the host named
+// another one (control.h).
+HK_API bool HK_IsOnMainThread();
+// True on threads that marked themselves as render threads (control.h).
+HK_API bool HK_IsOnRenderThread();
+
+// ---------------------------------------------------------------------------
+// Error reports, localised strings, verifications, exceptions
+// ---------------------------------------------------------------------------
+// Shows `detail` to the user as an error of `group` and `number`, unless
+// errors are quiet on this thread (then it is only logged as suppressed).
+HK_API void HKp_ReportErrString(std::int32_t group, std::int32_t number, const char* detail);
+
+// A module's localised message table: entries of "key=text" strings, each
+// followed by three slots that the string service owns.
+struct HK_LStrEntry {
+  const char* keyAndText;  // "key=default text", optionally followed by "{{*COMMENT*}}note"
+  std::intptr_t slots[3];
+};
+struct HK_LStrCacheRec {
+  const char* moduleKey;
+  std::int32_t count;  // entries including the terminating one
+  HK_LStrEntry* entries;
+};
+using HK_ZRef = HK_LStrCacheRec*;
+
+// The text of entry `index` of the table: the part after the first '=',
+// without a translator note. An index outside the table gives "".
+HK_API std::string HK_ZLookupLStrCache(HK_ZRef table, int index, int reserved1, int reserved2);
+// The localised text of a "key=default text" string: the text after '='.
+HK_API std::string HK_ZStringToMBString(const char* keyAndText);
+
+// Records a failed internal check and returns.
+HK_API void HK_ReportFailedVerification(const char* file, int number, const char* expression,
+                                        const char* message);
+// Reports a caught exception to the user (unless quiet) and returns the
+// error code it stands for (never 0).
+HK_API int HK_TranslateAndReportException(const std::exception& e);
+
+// Quiet errors nest per thread: between a start and its end, no error is
+// shown to the user from this thread. Returns 0 on success (a non-zero
+// status can be forced through control.h).
+HK_API int HK_StartQuietErrorsOnCurrentThread(bool quiet);
+HK_API void HK_EndQuietErrorsOnCurrentThread();
+HK_API bool HK_AreErrorsQuietOnCurrentThread();
+
+// ---------------------------------------------------------------------------
+// Logging
+// ---------------------------------------------------------------------------
+// One line through the host's log sink, if level passes the filter
+// (lines at or below the configured level are written; default 10).
+HK_API void JOT_Log(int level, const char* module, const char* tag, const char* message);
+HK_API void JOT_sprintf(int level, const char* module, const char* tag, const char* format, ...)
+    __attribute__((format(printf, 4, 5)));
+// The message text of a trace: "<operation>: <formatted text>".
+HK_API std::string JOT_convertMesg(const char* operation, const char* format, ...)
+    __attribute__((format(printf, 2, 3)));
+
+// ---------------------------------------------------------------------------
+// Memory
+// ---------------------------------------------------------------------------
+// Selector of the statistic that counts the bytes the host's items hold.
+inline constexpr int HK_MemStatItemBytes = 6;
+// Writes the statistic to *value. Returns 0 on success, a non-zero status for
+// an unknown selector or when a failure was forced (control.h).
+HK_API int HK_GetMemoryStat(int selector, std::uint64_t* value);
+// Tracked allocation: adds to / subtracts from statistic 6.
+HK_API void* HK_TrackedAlloc(std::size_t bytes);
+HK_API void HK_TrackedFree(void* p, std::size_t bytes) noexcept;
+HK_API void HK_TrackBytes(std::int64_t delta);
+
+// Base for objects allocated through tracked allocation.
+class HK_API HK_MemTrackedObject {
+ public:
+  static void* operator new(std::size_t bytes);
+  static void operator delete(void* p, std::size_t bytes) noexcept;
+};
+
+// ---------------------------------------------------------------------------
+// Machine, text, clock
+// ---------------------------------------------------------------------------
+// Writes the computer name (possibly empty) zero-terminated into buffer,
+// cut to fit. Returns 0 on success, non-zero for a bad buffer or a forced failure.
+HK_API int HK_GetComputerName(int bufferSize, char* buffer);
+// Copies text zero-terminated into buffer, cut to fit. Returns 0 on success.
+HK_API int HK_CopyString(const char* text, int bufferSize, char* buffer);
+
+// The host's multibyte encoding is UTF-8.
+using HK_UTF16String = plinth::utility::SmallUString;
+HK_API HK_UTF16String HK_AsciiToUTF16String(const char* text);
+HK_API HK_UTF16String HK_MBToUTF16String(const char* text);
+HK_API std::string HK_UTF16ToMBString(const HK_UTF16String& text, bool replaceInvalid);
+
+// A monotonic millisecond count. Returns 0 on success.
+HK_API int HK_MillisecondsSinceBoot(std::uint64_t* ms);
+
+// The host's 8-byte time record; copied whole, never interpreted here.
+struct T_Time {
+  std::int64_t value;
+};
+
+// ---------------------------------------------------------------------------
+// Preferences (an INI file; see control.h)
+// ---------------------------------------------------------------------------
+using ST_PrefHandle = void*;
+// The store of preference `type` (0: the text-preference store); null for
+// an unknown type.
+HK_API ST_PrefHandle ST_GetPrefHandle(int type);
+// Stored value or the default when the key is missing; returns 0. A value
+// that is present but not a number of the asked kind, or a bad handle, gives
+// a non-zero status and leaves *value at the default.
+HK_API int ST_GetTextPrefLong(ST_PrefHandle handle, const char* section, const char* key,
+                              std::int32_t defaultValue, std::int32_t* value);
+HK_API int ST_GetTextPrefFpLong(ST_PrefHandle handle, const char* section, const char* key,
+                                double defaultValue, double* value);

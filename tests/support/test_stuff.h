@@ -1,0 +1,94 @@
+// A test item: its size, memory and disk state and its answers to requests
+// are set by the test, and it records what it was asked (and its death) in a
+// journal that outlives it.
+#pragma once
+
+#include <atomic>
+#include <boost/intrusive_ptr.hpp>
+#include <functional>
+#include <memory>
+#include <mutex>
+#include <optional>
+#include <string>
+#include <vector>
+
+#include "rkcache/rkcache.h"
+
+namespace rktest {
+
+// What was done to one or more test items, in order. Thread-safe.
+class Journal {
+ public:
+  void Add(const std::string& event);
+  std::vector<std::string> Events() const;
+  // How many events equal `event`.
+  int Count(const std::string& event) const;
+  void Clear();
+
+ private:
+  mutable std::mutex mutex_;
+  std::vector<std::string> events_;
+};
+
+class TestStuff : public RK_Stuff {
+ public:
+  // An item of `size` bytes, in memory unless told otherwise. When
+  // trackMemory is true, the item's bytes count in host memory statistic 6
+  // while it is in memory, so freeing it lowers the statistic.
+  explicit TestStuff(std::uint32_t size = 1000, bool inMemory = true, bool trackMemory = false,
+                     std::shared_ptr<Journal> journal = nullptr, std::string name = "item");
+
+  static boost::intrusive_ptr<TestStuff> Make(std::uint32_t size = 1000, bool inMemory = true,
+                                              bool trackMemory = false,
+                                              std::shared_ptr<Journal> journal = nullptr,
+                                              std::string name = "item");
+
+  // ---- Controls ----
+  void SetInMemory(bool inMemory);                // adjusts the tracked bytes
+  void SetOnDisk(std::optional<bool> onDisk);     // nullopt: the base answer (has a cache file)
+  void SetSize(std::uint32_t size) { size_.store(size); }
+  void SetCanDiskCache(bool can) { canDiskCache_.store(can); }
+  // Answers of IdenticalRequest / CanSatisfyRequest; default: true.
+  void SetIdentical(std::function<bool(const RK_Stuff*)> f) { identical_ = std::move(f); }
+  void SetCanSatisfy(std::function<bool(const RK_Stuff*)> f) { canSatisfy_ = std::move(f); }
+  // FreeMemory frees (and returns true) unless told to refuse.
+  void SetFreeMemoryRefuses(bool refuses) { freeRefuses_.store(refuses); }
+  // Makes the next calls of a virtual throw `code` (0: no throw).
+  void SetThrowFromIsInMemory(int code) { throwIsInMemory_.store(code); }
+  const std::string& Name() const { return name_; }
+  const std::shared_ptr<Journal>& GetJournal() const { return journal_; }
+  std::uint64_t TrackedBytes() const { return tracked_.load(); }
+
+  // ---- RK_Stuff ----
+  bool IdenticalRequest(const RK_Stuff* request) const override;
+  bool CanSatisfyRequest(const RK_Stuff* request) const override;
+  std::uint32_t GetSizeInBytes() override;
+  bool FreeMemory() override;
+  bool IsInMemory() override;
+  bool CanDiskCache() const override { return canDiskCache_.load(); }
+  bool IsOnDisk() const override;
+  void YourDiskCacheFileWasDeleted() const override;
+
+ protected:
+  ~TestStuff() override;
+
+ private:
+  void Note(const std::string& what) const;
+
+  std::string name_;
+  std::shared_ptr<Journal> journal_;
+  std::atomic<std::uint32_t> size_;
+  std::atomic<bool> inMemory_;
+  std::atomic<int> onDisk_{-1};  // -1: base answer, 0 / 1: forced
+  std::atomic<bool> canDiskCache_{false};
+  std::atomic<bool> freeRefuses_{false};
+  std::atomic<int> throwIsInMemory_{0};
+  bool trackMemory_;
+  std::atomic<std::uint64_t> tracked_{0};
+  std::function<bool(const RK_Stuff*)> identical_;
+  std::function<bool(const RK_Stuff*)> canSatisfy_;
+};
+
+using TestStuffPtr = boost::intrusive_ptr<TestStuff>;
+
+}  // namespace rktest
