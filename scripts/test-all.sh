@@ -19,18 +19,18 @@ export UBSAN_OPTIONS=print_stacktrace=1:halt_on_error=1
 export TSAN_OPTIONS=halt_on_error=1:second_deadlock_stack=1
 
 configure_and_test() {
-  local dir=$1 label=$2; shift 2
+  local dir=$1 label=$2 target=$3; shift 3
   echo "=== ${dir}: configure"
   cmake -S "$root" -B "$root/$dir" -G Ninja -DRK_WARNINGS_AS_ERRORS=ON "$@"
   echo "=== ${dir}: build"
-  cmake --build "$root/$dir" -j "$jobs"
+  cmake --build "$root/$dir" -j "$jobs" ${target:+--target "$target"}
   echo "=== ${dir}: test"
   (cd "$root/$dir" && RK_TEST_TMPDIR="$root/$dir/test-tmp" ctest -j "$jobs" --timeout 300 ${label:+-L "$label"})
 }
 
-configure_and_test build "" -DCMAKE_BUILD_TYPE=RelWithDebInfo
-configure_and_test build-asan "" -DCMAKE_BUILD_TYPE=Debug -DRK_SANITIZE=address -DRK_BUILD_BENCH=OFF
-configure_and_test build-tsan concurrency -DCMAKE_BUILD_TYPE=RelWithDebInfo -DRK_SANITIZE=thread \
+configure_and_test build "" "" -DCMAKE_BUILD_TYPE=RelWithDebInfo
+configure_and_test build-asan "" "" -DCMAKE_BUILD_TYPE=Debug -DRK_SANITIZE=address -DRK_BUILD_BENCH=OFF
+configure_and_test build-tsan concurrency rk_concurrency_tests -DCMAKE_BUILD_TYPE=RelWithDebInfo -DRK_SANITIZE=thread \
   -DCMAKE_CXX_COMPILER=clang++ -DRK_BUILD_BENCH=OFF -DRK_BUILD_TOOLS=OFF
 
 echo "=== all test builds passed"
