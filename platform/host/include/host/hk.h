@@ -17,6 +17,17 @@
 #include "plinth/types.h"
 
 // ---------------------------------------------------------------------------
+// Status codes of the host services (0 is success)
+// ---------------------------------------------------------------------------
+inline constexpr int HK_ErrBadParameter = 0x4B01;     // null pointer, buffer size <= 0
+inline constexpr int HK_ErrUnknownSelector = 0x4B02;  // HK_GetMemoryStat selector
+inline constexpr int HK_ErrOutOfMemory = 0x4B03;      // a translated std::bad_alloc
+inline constexpr int HK_ErrException = 0x4B04;        // any other translated exception
+inline constexpr int HK_ErrClock = 0x4B05;            // the system clock could not be read
+inline constexpr int ST_ErrBadHandle = 0x4C01;        // not a handle from ST_GetPrefHandle
+inline constexpr int ST_ErrBadValue = 0x4C02;         // stored text is not a number of the asked kind
+
+// ---------------------------------------------------------------------------
 // Threads
 // ---------------------------------------------------------------------------
 // The main thread is the process's initial thread unless the host named
@@ -46,7 +57,9 @@ struct HK_LStrCacheRec {
 using HK_ZRef = HK_LStrCacheRec*;
 
 // The text of entry `index` of the table: the part after the first '=',
-// without a translator note. An index outside the table gives "".
+// without a translator note (from "{{*COMMENT*}}" on); a text without '='
+// is returned whole. An index outside the table, or at or past the
+// terminating entry (null text), gives "".
 HK_API std::string HK_ZLookupLStrCache(HK_ZRef table, int index, int reserved1, int reserved2);
 // The localised text of a "key=default text" string: the text after '='.
 HK_API std::string HK_ZStringToMBString(const char* keyAndText);
@@ -55,12 +68,16 @@ HK_API std::string HK_ZStringToMBString(const char* keyAndText);
 HK_API void HK_ReportFailedVerification(const char* file, int number, const char* expression,
                                         const char* message);
 // Reports a caught exception to the user (unless quiet) and returns the
-// error code it stands for (never 0).
+// error code it stands for (never 0): HK_ErrOutOfMemory for std::bad_alloc
+// (and its subclasses), HK_ErrException for anything else.
 HK_API int HK_TranslateAndReportException(const std::exception& e);
 
 // Quiet errors nest per thread: between a start and its end, no error is
-// shown to the user from this thread. Returns 0 on success (a non-zero
-// status can be forced through control.h).
+// shown to the user from this thread. The innermost open bracket decides:
+// start(true) makes errors quiet, start(false) shows them again until its
+// end. Returns 0 on success (a non-zero status can be forced through
+// control.h; then no bracket is opened and no end is owed). An end without
+// an open bracket is logged and ignored.
 HK_API int HK_StartQuietErrorsOnCurrentThread(bool quiet);
 HK_API void HK_EndQuietErrorsOnCurrentThread();
 HK_API bool HK_AreErrorsQuietOnCurrentThread();
@@ -83,9 +100,11 @@ HK_API std::string JOT_convertMesg(const char* operation, const char* format, ..
 // Selector of the statistic that counts the bytes the host's items hold.
 inline constexpr int HK_MemStatItemBytes = 6;
 // Writes the statistic to *value. Returns 0 on success, a non-zero status for
-// an unknown selector or when a failure was forced (control.h).
+// an unknown selector (HK_ErrUnknownSelector), a null value
+// (HK_ErrBadParameter) or when a failure was forced (control.h).
 HK_API int HK_GetMemoryStat(int selector, std::uint64_t* value);
-// Tracked allocation: adds to / subtracts from statistic 6.
+// Tracked allocation: adds to / subtracts from statistic 6, which never
+// goes below 0. HK_TrackedAlloc throws std::bad_alloc like operator new.
 HK_API void* HK_TrackedAlloc(std::size_t bytes);
 HK_API void HK_TrackedFree(void* p, std::size_t bytes) noexcept;
 HK_API void HK_TrackBytes(std::int64_t delta);
@@ -101,18 +120,26 @@ class HK_API HK_MemTrackedObject {
 // Machine, text, clock
 // ---------------------------------------------------------------------------
 // Writes the computer name (possibly empty) zero-terminated into buffer,
-// cut to fit. Returns 0 on success, non-zero for a bad buffer or a forced failure.
+// cut to fit. Returns 0 on success, non-zero for a bad buffer or a forced
+// failure. Cutting never splits a UTF-8 character.
 HK_API int HK_GetComputerName(int bufferSize, char* buffer);
-// Copies text zero-terminated into buffer, cut to fit. Returns 0 on success.
+// Copies text zero-terminated into buffer, cut to fit without splitting a
+// UTF-8 character. Returns 0 on success, HK_ErrBadParameter for a null buffer
+// or text or a size <= 0.
 HK_API int HK_CopyString(const char* text, int bufferSize, char* buffer);
 
-// The host's multibyte encoding is UTF-8.
+// The host's multibyte encoding is UTF-8. HK_AsciiToUTF16String throws
+// std::invalid_argument for a byte above 0x7F; HK_MBToUTF16String converts
+// ill-formed UTF-8 with U+FFFD in place of each bad sequence;
+// HK_UTF16ToMBString throws std::invalid_argument for a lone surrogate unless
+// replaceInvalid is true (then it becomes U+FFFD). A null text gives "".
 using HK_UTF16String = plinth::utility::SmallUString;
 HK_API HK_UTF16String HK_AsciiToUTF16String(const char* text);
 HK_API HK_UTF16String HK_MBToUTF16String(const char* text);
 HK_API std::string HK_UTF16ToMBString(const HK_UTF16String& text, bool replaceInvalid);
 
-// A monotonic millisecond count. Returns 0 on success.
+// A monotonic millisecond count (CLOCK_MONOTONIC, or the test clock of
+// control.h). Returns 0 on success.
 HK_API int HK_MillisecondsSinceBoot(std::uint64_t* ms);
 
 // The host's 8-byte time record; copied whole, never interpreted here.
