@@ -4,6 +4,7 @@
 #pragma once
 
 #include "plinth/debug.h"
+#include "rkcache/export.h"
 
 enum RKp_ProfileScopeId {
   RKp_Profile_SortDirAddStuff,         // "VX.render.RK_SortDir::AddStuff", 6
@@ -19,6 +20,6 @@ enum RKp_ProfileScopeId {
 
 // The log for a scope if profiling is on at its volume (created once),
 // else an empty pointer.
-boost::intrusive_ptr<plinth::debug::ProfileDataLog> RKp_ProfileLogFor(RKp_ProfileScopeId id);
+RK_INTERNAL boost::intrusive_ptr<plinth::debug::ProfileDataLog> RKp_ProfileLogFor(RKp_ProfileScopeId id);
 
 #define RK_PROFILE_SCOPE(id) plinth::debug::CodeProfiler rk_profile_scope_(RKp_ProfileLogFor(id))

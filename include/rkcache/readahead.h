@@ -16,6 +16,7 @@
 #include <boost/shared_ptr.hpp>
 #include <boost/thread/once.hpp>
 #include <boost/thread/recursive_mutex.hpp>
+#include <cstdint>
 #include <map>
 
 #include "host/hk.h"
@@ -35,7 +36,8 @@ class RK_EXPORT ReadAheadInfo : private boost::noncopyable {
   bool DoReadAhead() const;
   // Switches read-ahead on or off and resets the skip interval to 1;
   // switching off calls every cancel callback once, in ascending key order.
-  // An exception from a callback ends the loop and passes to the caller.
+  // An exception from a callback (boost::bad_function_call for an empty
+  // one) ends the loop and passes to the caller.
   void SetDoReadAhead(bool on);
   int GetReadAheadSkipInterval() const;
   void SetReadAheadSkipInterval(int interval);
@@ -53,7 +55,10 @@ class RK_EXPORT ReadAheadInfo : private boost::noncopyable {
 
   std::atomic<int> mDoReadAhead{0};
   std::atomic<int> mReadAheadSkipInterval{1};
-  T_Time mActualDisplayTime{};  // copied whole without a lock
+  // The host's 8-byte time record, copied whole and never interpreted. Kept
+  // as one atomic word so that it can be copied without a lock and without a
+  // torn read while another thread sets it.
+  std::atomic<std::int64_t> mActualDisplayTime{0};
   mutable boost::recursive_mutex mMutex;
   std::map<void*, boost::function<void()>> mCancelCallbacks;  // mMutex
 

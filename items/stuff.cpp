@@ -1,0 +1,70 @@
+// RK_Stuff: construction, destruction, the base class's virtual answers, the
+// bag's ordering and the check-out state checks.
+//
+// An item's states: free (in no bag, or in bag and sort directory with no
+// check-out), checked out read-only (checkoutCount >= 1), checked out
+// writeable (checkoutCount == 1, out of its sort directory), on disk only
+// (diskCacheFile set, memory freed), and dropped while still held (in no bag
+// or sort directory, alive through a host or check-out reference).
+// Invariants: checkedOutWriteable implies checkoutCount == 1; each check-out
+// holds one reference, so a checked-out item is never destroyed.
+#include "rkcache/stuff.h"
+
+#include "frame/report.h"
+#include "rkcache/errors.h"
+#include "rkcache/lifecycle.h"
+
+RK_Stuff::RK_Stuff() : guid(plinth::utility::Guid::CreateUnique()), lastUseTime(RK_Now()) {}
+
+// Only the last release gets here, and the bag and sort directory each hold
+// a reference while they index the item, so neither can still name it. The
+// weak links and the cache file reference go with the members; the cache
+// file itself stays on disk.
+RK_Stuff::~RK_Stuff() = default;
+
+bool RK_Stuff::IdenticalRequest(const RK_Stuff*) const {
+  return true;
+}
+
+bool RK_Stuff::CanSatisfyRequest(const RK_Stuff*) const {
+  return true;
+}
+
+bool RK_Stuff::CanDiskCache() const {
+  return false;
+}
+
+const char* RK_Stuff::GetSubclassMatchname() const {
+  return nullptr;
+}
+
+void RK_Stuff::GetHeader(RK_HeaderBytes&) const {}
+
+void RK_Stuff::Write(plinth::filesupport::OByteStream&) const {}
+
+void RK_Stuff::Read(plinth::filesupport::IByteStream&) {}
+
+void RK_Stuff::YourDiskCacheFileWasDeleted() const {}
+
+bool RK_Stuff::IsOnDisk() const {
+  return static_cast<bool>(diskCacheFile);
+}
+
+bool RK_LastUseOrder::operator()(const RK_Stuff* a, const RK_Stuff* b) const {
+  return a->lastUseTime < b->lastUseTime;
+}
+
+// The checks read the count without the lock: they run on the thread that
+// holds (or should hold) the check-out, whose own count cannot change under it.
+// The comparisons are unsigned, so a negative n turns into a huge bound.
+void RK_Stuff::ThrowIfCheckedOutLessThan(int n) const {
+  if (GetCheckoutCount() < static_cast<std::uint32_t>(n)) RKp_ThrowUserError(RK_ModuleErrorNotCheckedOut, 22);
+}
+
+void RK_Stuff::ThrowIfCheckedOutMoreThan(int n) const {
+  if (GetCheckoutCount() > static_cast<std::uint32_t>(n)) RKp_ThrowUserError(RK_ModuleErrorCheckout, 12);
+}
+
+void RK_Stuff::ThrowIfCheckedOutWriteable() const {
+  if (IsCheckedOutWriteable()) RKp_ThrowUserError(RK_ModuleErrorCheckout, 11);
+}
