@@ -68,6 +68,7 @@ class RK_EXPORT RK_Bag : public HK_MemTrackedObject, public boost::enable_shared
  private:
   friend class RK_Stuff;
   friend class RK_ScCacheLock;
+  friend class RK_SortDir;  // its destructor releases items from their bag
   friend class RK_TEST_Access;
 
   // The same as AddStuff / RemoveStuff without taking the lock and (for
@@ -75,12 +76,15 @@ class RK_EXPORT RK_Bag : public HK_MemTrackedObject, public boost::enable_shared
   void AddStuffGuts(boost::intrusive_ptr<RK_Stuff> stuff);
   void RemoveStuffGuts(RK_Stuff* stuff);
 
-  RK_StuffByLastUse stuffByLastUse;              // cache lock
-  std::uint32_t lockHoldCount = 0;               // cache lock (raised by RK_ScCacheLock)
-  std::atomic<bool> diskCacheEnabled{false};     // atomic: read without the lock
-  plinth::filesupport::Dir diskCacheDir;         // written by the configuring thread
-  plinth::ustring diskCacheRootPath;             // written by the configuring thread
-  std::int64_t diskCacheSizeLimit = 0;           // bytes
-  std::int64_t diskCacheSize = 0;                // bytes; cache lock
-  std::uint32_t appVersion = 0;                  // bit 31 always clear
+  RK_StuffByLastUse stuffByLastUse;  // cache lock
+  // The node of the last removed element, reused by the next insertion so
+  // that check-in's remove-and-restamp does not allocate. Cache lock.
+  RK_StuffByLastUse::node_type spareNode;
+  std::uint32_t lockHoldCount = 0;            // cache lock (raised by RK_ScCacheLock)
+  std::atomic<bool> diskCacheEnabled{false};  // atomic: read without the lock
+  plinth::filesupport::Dir diskCacheDir;      // written by the configuring thread
+  plinth::ustring diskCacheRootPath;          // written by the configuring thread
+  std::int64_t diskCacheSizeLimit = 0;        // bytes
+  std::int64_t diskCacheSize = 0;             // bytes; cache lock
+  std::uint32_t appVersion = 0;               // bit 31 always clear
 };

@@ -114,6 +114,8 @@ class RK_EXPORT RK_Stuff : public plinth::utility::RefCountedObject {
   friend class RK_ScCheckout;
   friend struct RK_LastUseOrder;
   friend class RK_TEST_Access;  // test hook, defined by the test suites only
+  // Binds the private write job (diskcache/background_write.h).
+  friend bool RKp_QueueBackgroundWrite(const boost::intrusive_ptr<RK_Stuff>& stuff);
 
   void TempRemoveFromSortDir();
   bool FreeUpAsMuchAsPossible();
