@@ -31,16 +31,16 @@ class PLINTH_API SmallBlockAllocator {
     STLAllocator() noexcept = default;
     template <class U>
     STLAllocator(const STLAllocator<U>&) noexcept {}  // NOLINT: rebind
-    T* allocate(std::size_t n) {
-      return static_cast<T*>(SmallBlockAllocator::Allocate(n * sizeof(T)));
-    }
-    void deallocate(T* p, std::size_t n) noexcept {
-      SmallBlockAllocator::Deallocate(p, n * sizeof(T));
+    T* allocate(std::size_t n) { return static_cast<T*>(SmallBlockAllocator::Allocate(n * sizeof(T))); }
+    void deallocate(T* p, std::size_t n) noexcept { SmallBlockAllocator::Deallocate(p, n * sizeof(T)); }
+    template <class U>
+    bool operator==(const STLAllocator<U>&) const noexcept {
+      return true;
     }
     template <class U>
-    bool operator==(const STLAllocator<U>&) const noexcept { return true; }
-    template <class U>
-    bool operator!=(const STLAllocator<U>&) const noexcept { return false; }
+    bool operator!=(const STLAllocator<U>&) const noexcept {
+      return false;
+    }
   };
 };
 

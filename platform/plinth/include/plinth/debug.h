@@ -54,11 +54,11 @@ class PLINTH_API ProfileDataLog : public utility::RefCountedObject {
   std::string name_;
   int volume_;
   mutable std::mutex mutex_;
-  std::uint64_t count_ = 0;                    // guarded by mutex_
-  std::chrono::nanoseconds total_{0};          // guarded by mutex_
-  std::chrono::nanoseconds max_{0};            // guarded by mutex_
+  std::uint64_t count_ = 0;                       // guarded by mutex_
+  std::chrono::nanoseconds total_{0};             // guarded by mutex_
+  std::chrono::nanoseconds max_{0};               // guarded by mutex_
   std::vector<std::chrono::nanoseconds> recent_;  // guarded by mutex_ (ring of kKeep)
-  std::size_t next_ = 0;                       // guarded by mutex_
+  std::size_t next_ = 0;                          // guarded by mutex_
 };
 
 class PLINTH_API CodeProfilerManager {

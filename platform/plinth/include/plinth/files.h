@@ -40,7 +40,8 @@ class PLINTH_API io_error : public std::runtime_error {
 // The file, or a folder on its path, does not exist.
 class PLINTH_API file_not_found_exception : public io_error {
  public:
-  explicit file_not_found_exception(const ustring& path);
+  explicit file_not_found_exception(const ustring& path);   // Code() is ENOENT
+  file_not_found_exception(const ustring& path, int code);  // ENOENT or ENOTDIR
 };
 
 // Native view of a file's path.
@@ -62,7 +63,7 @@ class PLINTH_API File {
 
   bool IsEmpty() const { return path_.empty(); }
   ustring FullPath() const { return path_; }
-  ustring GetName() const;                  // last component, extension included
+  ustring GetName() const;                   // last component, extension included
   ustring GetExtension(bool withDot) const;  // "" when the name has no '.'
   Dir GetParent() const;
   FileHelper Helper() const { return FileHelper(path_); }
@@ -73,6 +74,7 @@ class PLINTH_API File {
   void Create(bool exclusive) const;
   void Delete() const;  // throws file_not_found_exception when absent
   // Renames within the same folder; this object then names the new file.
+  // An existing file of the new name is never replaced (io_error, EEXIST).
   void Rename(const ustring& newName);
   // Selector 0: the length in bytes. Other selectors are reserved (0 is returned).
   std::uint64_t Size(int selector) const;

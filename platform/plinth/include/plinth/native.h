@@ -24,8 +24,12 @@ struct UnbufferedWriteHandle {
 // file or its folder is missing, filesupport::io_error for other failures.
 PLINTH_API UnbufferedWriteHandle OpenExistingForUnbufferedWrite(const ustring& path);
 
-// The logical sector size of the volume mounted at (or holding) volumePath;
-// false when it cannot be determined.
+// Test control: while on, every open behaves as on a file system that
+// refuses O_DIRECT, so the fallback can be exercised on any disk.
+PLINTH_API void TEST_SimulateDirectIORefusal(bool refuse);
+
+// The direct-I/O alignment (the logical sector size) of the volume mounted
+// at (or holding) volumePath; false when it cannot be determined.
 PLINTH_API bool GetVolumeSectorSize(const ustring& volumePath, std::uint32_t& sectorSize);
 
 // Marks a file as not to be indexed by desktop search. Returns false where

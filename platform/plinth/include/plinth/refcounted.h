@@ -43,8 +43,12 @@ class PLINTH_API RefCountedObject : public virtual RefCountedInterface {
   mutable bool beingDeleted = false;  // set once, by the release that deletes
 };
 
-inline void intrusive_ptr_add_ref(const RefCountedInterface* p) { p->AddRef(); }
-inline void intrusive_ptr_release(const RefCountedInterface* p) { p->Release(); }
+inline void intrusive_ptr_add_ref(const RefCountedInterface* p) {
+  p->AddRef();
+}
+inline void intrusive_ptr_release(const RefCountedInterface* p) {
+  p->Release();
+}
 
 }  // namespace utility
 }  // namespace plinth

@@ -39,9 +39,9 @@ class PLINTH_API IByteStream : public virtual ByteStream_base {
 };
 
 // Flags for the platform streams.
-inline constexpr unsigned kStreamRead = 1;       // IPlatformByteStream: open for reading
-inline constexpr unsigned kStreamWrite = 1;      // OPlatformByteStream: open for writing
-inline constexpr unsigned kStreamTruncate = 2;   // OPlatformByteStream: truncate on open
+inline constexpr unsigned kStreamRead = 1;      // IPlatformByteStream: open for reading
+inline constexpr unsigned kStreamWrite = 1;     // OPlatformByteStream: open for writing
+inline constexpr unsigned kStreamTruncate = 2;  // OPlatformByteStream: truncate on open
 
 // An output stream on an operating-system file handle.
 class PLINTH_API OPlatformByteStream : public OByteStream {

@@ -31,9 +31,9 @@ class PLINTH_API AsyncExecutor {
 
 // What an executor holds and does, for tests and diagnostics.
 struct ExecutorSnapshot {
-  std::size_t running = 0;                // tasks running now
-  std::size_t ready = 0;                  // tasks whose delay has passed, waiting to start
-  std::vector<std::uint32_t> delayedMs;   // delays (as submitted) of tasks still waiting for their time
+  std::size_t running = 0;               // tasks running now
+  std::size_t ready = 0;                 // tasks whose delay has passed, waiting to start
+  std::vector<std::uint32_t> delayedMs;  // delays (as submitted) of tasks still waiting for their time
   bool suspended = false;
   bool cancelled = false;
 };
@@ -66,8 +66,8 @@ PLINTH_API boost::shared_ptr<AsyncExecutor> CreateIOBoundExecutor();
 
 // An executor that runs its tasks on parent's threads, never more than
 // maxConcurrent of its own at a time. REQUIRES: parent non-null, maxConcurrent >= 1.
-PLINTH_API boost::shared_ptr<AsyncThreadedExecutor> CreateSubExecutor(const boost::shared_ptr<AsyncExecutor>& parent,
-                                                                      int maxConcurrent);
+PLINTH_API boost::shared_ptr<AsyncThreadedExecutor> CreateSubExecutor(
+    const boost::shared_ptr<AsyncExecutor>& parent, int maxConcurrent);
 
 // Runs a job on an executor after a delay, at most one run pending at a time.
 // Must be owned by a boost::shared_ptr (a pending run holds a weak pointer;
