@@ -22,10 +22,6 @@
 #include "rkcache/errors.h"
 #include "rkcache/lifecycle.h"
 
-bool RK_LastUseOrder::operator()(const RK_Stuff* a, const RK_Stuff* b) const {
-  return a->lastUseTime < b->lastUseTime;
-}
-
 RK_Bag::RK_Bag() = default;
 
 RK_Bag::~RK_Bag() {
