@@ -30,8 +30,11 @@ std::size_t CutLength(const char* text, std::size_t length, std::size_t limit) {
   return cut;
 }
 
-// Re-encodes text of the given unit type, replacing every ill-formed
-// sequence with U+FFFD.
+// Re-encodes text of the given unit type, replacing each unit that does not
+// start a well-formed sequence with U+FFFD. The decoder may have consumed
+// the unit after a bad one (a high surrogate's partner, a lead byte's
+// continuation); decoding goes on right after the bad unit so that no good
+// character is lost.
 template <class Out, class In>
 std::basic_string<Out> ReplaceInvalid(const std::basic_string<In>& text) {
   using namespace boost::locale::utf;
@@ -39,8 +42,12 @@ std::basic_string<Out> ReplaceInvalid(const std::basic_string<In>& text) {
   out.reserve(text.size());
   auto it = text.begin();
   while (it != text.end()) {
+    const auto start = it;
     code_point c = utf_traits<In>::decode(it, text.end());
-    if (c == illegal || c == incomplete) c = 0xFFFD;
+    if (c == illegal || c == incomplete) {
+      c = 0xFFFD;
+      it = start + 1;
+    }
     utf_traits<Out>::encode(c, std::back_inserter(out));
   }
   return out;

@@ -130,9 +130,10 @@ HK_API int HK_CopyString(const char* text, int bufferSize, char* buffer);
 
 // The host's multibyte encoding is UTF-8. HK_AsciiToUTF16String throws
 // std::invalid_argument for a byte above 0x7F; HK_MBToUTF16String converts
-// ill-formed UTF-8 with U+FFFD in place of each bad sequence;
-// HK_UTF16ToMBString throws std::invalid_argument for a lone surrogate unless
-// replaceInvalid is true (then it becomes U+FFFD). A null text gives "".
+// ill-formed UTF-8 with U+FFFD in place of each byte that does not start a
+// well-formed sequence; HK_UTF16ToMBString throws std::invalid_argument for a
+// lone surrogate unless replaceInvalid is true (then it becomes U+FFFD). A
+// null text gives "".
 using HK_UTF16String = plinth::utility::SmallUString;
 HK_API HK_UTF16String HK_AsciiToUTF16String(const char* text);
 HK_API HK_UTF16String HK_MBToUTF16String(const char* text);
