@@ -24,6 +24,7 @@ class RK_TEST_Access {
   static RK_FactoryMap* FactoryRegistry() { return RK_Stuff::S_factory_funcsP; }
   static void SetLastUseTime(RK_Stuff& s, const boost::posix_time::ptime& t) { s.lastUseTime = t; }
   static void SetCheckoutCount(RK_Stuff& s, std::uint32_t n) { s.checkoutCount.store(n); }
+  static void SetCheckedOutWriteable(RK_Stuff& s, bool w) { s.checkedOutWriteable.store(w); }
   static void SetDiskCacheFile(RK_Stuff& s, boost::shared_ptr<plinth::filesupport::File> f) {
     s.diskCacheFile = std::move(f);
   }
