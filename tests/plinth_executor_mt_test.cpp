@@ -338,20 +338,23 @@ TEST(PlinthExecutor, CancelledParentDropsAChildsTasksAndTheChildStaysWaitable) {
   auto parent = NewSub(1);
   auto child = CreateSubExecutor(parent, 2);
   parent->Suspend();
+  constexpr int kTasks = 20000;  // deep enough to overflow a recursive hand-over
   std::atomic<int> destroyed{0};
   std::atomic<int> ran{0};
-  for (int i = 0; i < 3; ++i) {
+  for (int i = 0; i < kTasks; ++i) {
     auto t = boost::make_shared<Tracked>(destroyed);
     child->Submit([t, &ran] { ++ran; }, 0);
   }
   EXPECT_EQ(child->Snapshot().running, 2u);  // handed to the parent
-  EXPECT_EQ(child->Snapshot().ready, 1u);
+  EXPECT_EQ(child->Snapshot().ready, static_cast<std::size_t>(kTasks - 2));
   EXPECT_EQ(parent->Snapshot().ready, 2u);
   parent->Cancel();
   child->WaitUntilIdle();  // does not hang on tasks the parent dropped
   EXPECT_EQ(ran.load(), 0);
-  EXPECT_EQ(destroyed.load(), 3);
-  EXPECT_EQ(child->Snapshot().running, 0u);
+  EXPECT_EQ(destroyed.load(), kTasks);
+  const ExecutorSnapshot s = child->Snapshot();
+  EXPECT_EQ(s.running, 0u);
+  EXPECT_EQ(s.ready, 0u);
 }
 
 TEST(PlinthQueueOnlyOnce, OneRunPendingAtATimeAndNoRunAfterDestruction) {

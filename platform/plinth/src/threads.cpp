@@ -11,6 +11,7 @@
 // after Cancel, ready_ and delayed_ stay empty.
 #include "plinth/threads.h"
 
+#include <algorithm>
 #include <atomic>
 #include <boost/asio/post.hpp>
 #include <boost/asio/steady_timer.hpp>
@@ -207,18 +208,27 @@ class SubExecutor final : public AsyncThreadedExecutor, public boost::enable_sha
   // Starts ready tasks while slots are free. Called with the lock held;
   // releases it while handing tasks to the parent.
   void Pump(std::unique_lock<std::mutex>& lock) {
-    std::vector<boost::function<void()>> launch;
-    while (!cancelled_ && !suspended_ && running_ < limit_ && !ready_.empty()) {
-      launch.push_back(std::move(ready_.front()));
-      ready_.pop_front();
-      ++running_;
-    }
-    if (launch.empty()) return;
-    boost::shared_ptr<SubExecutor> self = shared_from_this();
-    lock.unlock();
-    for (auto& task : launch) {
-      auto slot = std::make_shared<Slot>(self, std::move(task));
-      parent_->Submit([slot] { slot->Run(); }, 0);
+    for (;;) {
+      std::vector<boost::function<void()>> launch;
+      while (!cancelled_ && !suspended_ && running_ < limit_ && !ready_.empty()) {
+        launch.push_back(std::move(ready_.front()));
+        ready_.pop_front();
+        ++running_;
+      }
+      if (launch.empty()) return;
+      boost::shared_ptr<SubExecutor> self = shared_from_this();
+      lock.unlock();
+      {
+        // A parent that drops a task (it was cancelled) frees the slot inside
+        // its Submit; Finished then leaves the next start to this loop
+        // instead of recursing once per queued task.
+        PumpingMark mark(this);
+        for (auto& task : launch) {
+          auto slot = std::make_shared<Slot>(self, std::move(task));
+          parent_->Submit([slot] { slot->Run(); }, 0);
+        }
+      }
+      lock.lock();
     }
   }
 
@@ -226,8 +236,25 @@ class SubExecutor final : public AsyncThreadedExecutor, public boost::enable_sha
     std::unique_lock<std::mutex> lock(mutex_);
     --running_;
     idle_.notify_all();
-    Pump(lock);
+    if (!PumpingMark::IsPumping(this)) Pump(lock);
   }
+
+  // Which executors the calling thread is handing tasks to right now.
+  class PumpingMark {
+   public:
+    explicit PumpingMark(const SubExecutor* ex) { Stack().push_back(ex); }
+    ~PumpingMark() { Stack().pop_back(); }
+    static bool IsPumping(const SubExecutor* ex) {
+      const auto& s = Stack();
+      return std::find(s.begin(), s.end(), ex) != s.end();
+    }
+
+   private:
+    static std::vector<const SubExecutor*>& Stack() {
+      thread_local std::vector<const SubExecutor*> stack;
+      return stack;
+    }
+  };
 
   const boost::shared_ptr<AsyncExecutor> parent_;
   const std::size_t limit_;
