@@ -52,26 +52,17 @@ RK_CheckoutResult RK_Stuff::Checkout(int flags) {
   const std::uint32_t count = checkoutCount.load(std::memory_order_relaxed);
   if (writeable && count > 0) RKp_ThrowUserError(RK_ModuleErrorCheckout, kMsgAlreadyCheckedOut);
 
-  bool inMemory = IsInMemory();
+  const bool inMemory = IsInMemory();
   if ((flags & RK_Checkout_OnlyIfInMemory) && !inMemory) return RK_CheckoutResult_NotCheckedOut;
 
-  // The check-out's reference is taken before anything else happens: taking
-  // the item out of its directory drops the directory's reference, which may
-  // be the only other one (a lookup walks the directory's own elements).
+  // From here on, any failure takes the count off again. The check-out's
+  // reference is taken at once: taking the item out of its directory drops
+  // the directory's reference, which may be the only other one.
   checkoutCount.store(count + 1, std::memory_order_release);
   intrusive_ptr_add_ref(this);
-
-  // The directory the item was taken out of, to put it back if the
-  // check-out fails after all.
-  boost::shared_ptr<RK_SortDir> takenFrom;
   bool ok = false;
   try {
-    if (writeable) {
-      TempRemoveFromSortDir();
-      takenFrom = GetSortDir();
-      ok = inMemory || (flags & RK_Checkout_EvenIfNotInMemory) ||
-           ((flags & RK_Checkout_DontRead) && IsOnDisk());
-    } else if (!inMemory && (flags & RK_Checkout_DontRead) == 0 && IsOnDisk()) {
+    if (!writeable && !inMemory && (flags & RK_Checkout_DontRead) == 0 && IsOnDisk()) {
       // The read-back runs under the cache lock: the item cannot be evicted
       // or changed while its data arrives. A failed read fails the check-out
       // whatever the other flags say.
@@ -80,34 +71,23 @@ RK_CheckoutResult RK_Stuff::Checkout(int flags) {
       ok = inMemory || (flags & RK_Checkout_EvenIfNotInMemory) ||
            ((flags & RK_Checkout_DontRead) && IsOnDisk());
     }
+    // A writeable check-out leaves the directory only once it is sure to
+    // succeed: one that fails its final test never disturbs the directory,
+    // so the item stays where lookups find it.
+    if (ok && writeable) TempRemoveFromSortDir();
   } catch (...) {
+    ok = false;
     checkoutCount.store(checkoutCount.load(std::memory_order_relaxed) - 1, std::memory_order_release);
-    const boost::intrusive_ptr<RK_Stuff> checkoutRef(this, false);  // dropped on the way out
-    if (takenFrom) {
-      // Put back so the item is not lost to lookups; the original error is
-      // the one the caller gets.
-      RKp_Swallow([&] {
-        sortDir.reset();
-        takenFrom->AddStuff(checkoutRef);
-      });
-    }
+    intrusive_ptr_release(this);
     throw;
   }
-
-  if (ok) {
-    checkedOutWriteable.store(writeable, std::memory_order_release);
-    return RK_CheckoutResult_CheckedOut;
+  if (!ok) {
+    checkoutCount.store(checkoutCount.load(std::memory_order_relaxed) - 1, std::memory_order_release);
+    intrusive_ptr_release(this);
+    return RK_CheckoutResult_NotCheckedOut;
   }
-
-  checkoutCount.store(checkoutCount.load(std::memory_order_relaxed) - 1, std::memory_order_release);
-  const boost::intrusive_ptr<RK_Stuff> checkoutRef(this, false);  // dropped on the way out
-  if (takenFrom) {
-    // A writeable check-out that fails its final test puts the item back
-    // where it was, so that it is not lost to lookups.
-    sortDir.reset();
-    takenFrom->AddStuff(checkoutRef);
-  }
-  return RK_CheckoutResult_NotCheckedOut;
+  checkedOutWriteable.store(writeable, std::memory_order_release);
+  return RK_CheckoutResult_CheckedOut;
 }
 
 void RK_Stuff::TempRemoveFromSortDir() {

@@ -32,9 +32,9 @@ RK_CheckoutResult RK_SortDir::FindAndCheckout(const RK_Stuff* request, int flags
   if (range.first == range.second) return RK_CheckoutResult_NotCheckedOut;
 
   // The walk works on a copy of the group: checking a candidate out may
-  // change the directory (a writeable check-out takes the item out and puts
-  // it back on failure; a failed read-back deletes a cache file; item
-  // callbacks may re-enter the cache), which would invalidate iterators.
+  // change the directory (a failed read-back deletes a cache file; item
+  // callbacks may re-enter the cache and add or drop items), which would
+  // invalidate iterators.
   // The references keep every candidate alive until the walk is over.
   const Candidates candidates(range.first, range.second);
   const std::int64_t startCount = changeCount.load(std::memory_order_relaxed);
