@@ -1,0 +1,207 @@
+// The module's lifecycle: not born, alive, stopped, dead; the global objects
+// and their owners; the cache lock guard's hold count.
+#include <gtest/gtest.h>
+
+#include <atomic>
+#include <boost/make_shared.hpp>
+#include <boost/weak_ptr.hpp>
+#include <string>
+#include <vector>
+
+#include "host/control.h"
+#include "rkcache/rkcache.h"
+#include "rkcache/testing.h"
+#include "support/test_access.h"
+#include "support/test_stuff.h"
+
+namespace ctl = rkhost::control;
+
+namespace {
+
+// "level|module|tag|text" of every captured line of module "RK".
+std::vector<std::string> ModuleLogLines() {
+  std::vector<std::string> out;
+  for (const ctl::LogLine& line : ctl::Snapshot().logLines) {
+    if (line.module == "RK") out.push_back(std::to_string(line.level) + "|RK|" + line.tag + "|" + line.text);
+  }
+  return out;
+}
+
+const std::string kBirthLine = "10|RK|Birth|RK Birth";
+const std::string kStopLine = "10|RK|RK_StopAllAsyncWork|RK_StopAllAsyncWork";
+const std::string kDeathLine = "10|RK|Death|RK Death";
+
+}  // namespace
+
+TEST(FrameLifecycle, WalksFromNotBornThroughAliveAndStoppedToDead) {
+  ctl::ClearCaptured();
+
+  // Not born: no globals, and the guard still locks without a bag.
+  EXPECT_FALSE(RK_GlobalBag());
+  EXPECT_FALSE(RK_GlobalSortDir());
+  EXPECT_FALSE(RK_TEST_BackgroundExecutor());
+  { RK_ScCacheLock lock; }
+
+  RK_Birth(false);
+  boost::shared_ptr<RK_Bag> bag = RK_GlobalBag();
+  boost::shared_ptr<RK_SortDir> sortDir = RK_GlobalSortDir();
+  boost::shared_ptr<plinth::threads::AsyncThreadedExecutor> executor = RK_TEST_BackgroundExecutor();
+  ASSERT_TRUE(bag);
+  ASSERT_TRUE(sortDir);
+  ASSERT_TRUE(executor);
+  EXPECT_EQ(RK_GlobalBag(), bag);
+  EXPECT_EQ(RK_GlobalSortDir(), sortDir);
+  EXPECT_EQ(bag->GetStuffCount(), 0u);
+  EXPECT_EQ(sortDir->GetStuffCount(), 0u);
+  EXPECT_FALSE(executor->IsCancelled());
+  EXPECT_EQ(ModuleLogLines(), std::vector<std::string>{kBirthLine});
+
+  // Stopped: no executor, but bag and sort directory stay usable.
+  RK_StopAllAsyncWork();
+  EXPECT_TRUE(executor->IsCancelled());
+  EXPECT_FALSE(RK_TEST_BackgroundExecutor());
+  EXPECT_EQ(RK_GlobalBag(), bag);
+  EXPECT_EQ(RK_GlobalSortDir(), sortDir);
+  rktest::TestStuffPtr item = rktest::TestStuff::Make();
+  item->AddToBagAndSortDir(bag, boost::posix_time::milliseconds(1));
+  EXPECT_EQ(bag->GetStuffCount(), 1u);
+  EXPECT_EQ(item->GetBag(), bag);
+
+  // Dead: both globals dropped; with no other owner both objects go.
+  boost::weak_ptr<RK_Bag> bagWatch = bag;
+  boost::weak_ptr<RK_SortDir> sortDirWatch = sortDir;
+  bag.reset();
+  sortDir.reset();
+  RK_Death();
+  EXPECT_FALSE(RK_GlobalBag());
+  EXPECT_FALSE(RK_GlobalSortDir());
+  EXPECT_TRUE(bagWatch.expired());
+  EXPECT_TRUE(sortDirWatch.expired());
+  EXPECT_FALSE(item->GetBag());
+  { RK_ScCacheLock lock; }
+
+  EXPECT_EQ(ModuleLogLines(), (std::vector<std::string>{kBirthLine, kStopLine, kDeathLine}));
+}
+
+TEST(FrameLifecycle, BagAndSortDirComeFromTrackedAllocation) {
+  const std::uint64_t before = ctl::MemoryStat();
+  RK_Birth(false);
+  EXPECT_GE(ctl::MemoryStat() - before, sizeof(RK_Bag) + sizeof(RK_SortDir));
+  RK_StopAllAsyncWork();
+  RK_Death();
+  EXPECT_EQ(ctl::MemoryStat(), before);
+}
+
+TEST(FrameLifecycle, HostReferenceKeepsTheBagAlivePastDeath) {
+  RK_Birth(false);
+  boost::shared_ptr<RK_Bag> held = RK_GlobalBag();
+  boost::weak_ptr<RK_SortDir> sortDirWatch = RK_GlobalSortDir();
+  RK_StopAllAsyncWork();
+  RK_Death();
+
+  EXPECT_TRUE(sortDirWatch.expired());
+  EXPECT_FALSE(RK_GlobalBag());
+  ASSERT_TRUE(held);
+  // The guard finds no global bag, so the kept bag's count stays untouched.
+  {
+    RK_ScCacheLock lock;
+    EXPECT_EQ(RK_TEST_Access::LockHoldCount(*held), 0u);
+  }
+  EXPECT_EQ(held->GetStuffCount(), 0u);
+
+  boost::weak_ptr<RK_Bag> bagWatch = held;
+  EXPECT_FALSE(bagWatch.expired());
+  held.reset();
+  EXPECT_TRUE(bagWatch.expired());
+}
+
+TEST(FrameLifecycle, StoppingTwiceOnlyLogsTheSecondTime) {
+  RK_Birth(false);
+  RK_StopAllAsyncWork();
+  ctl::ClearCaptured();
+  RK_StopAllAsyncWork();
+  EXPECT_EQ(ModuleLogLines(), std::vector<std::string>{kStopLine});
+  EXPECT_FALSE(RK_TEST_BackgroundExecutor());
+  EXPECT_TRUE(RK_GlobalBag());
+  RK_Death();
+  EXPECT_FALSE(RK_GlobalBag());
+}
+
+TEST(FrameLifecycle, StopDropsQueuedAndDelayedTasksEvenWhileSuspended) {
+  RK_Birth(false);
+  boost::shared_ptr<plinth::threads::AsyncThreadedExecutor> executor = RK_TEST_BackgroundExecutor();
+  ASSERT_TRUE(executor);
+
+  // The token is held only by the tasks: its count shows whether they were
+  // destroyed unrun.
+  auto token = boost::make_shared<int>(0);
+  auto ran = boost::make_shared<std::atomic<int>>(0);
+  executor->Submit([token, ran] { ++*ran; }, 60000);
+
+  RK_DeprioritizeBackgroundWrites();
+  EXPECT_TRUE(executor->Snapshot().suspended);
+  executor->Submit([token, ran] { ++*ran; }, 0);
+  const plinth::threads::ExecutorSnapshot held = executor->Snapshot();
+  EXPECT_EQ(held.ready, 1u);
+  EXPECT_EQ(held.delayedMs, std::vector<std::uint32_t>{60000});
+  EXPECT_EQ(token.use_count(), 3);
+
+  RK_StopAllAsyncWork();  // must return although the executor was suspended
+  EXPECT_EQ(ran->load(), 0);
+  EXPECT_EQ(token.use_count(), 1);
+  const plinth::threads::ExecutorSnapshot after = executor->Snapshot();
+  EXPECT_EQ(after.running, 0u);
+  EXPECT_EQ(after.ready, 0u);
+  EXPECT_TRUE(after.delayedMs.empty());
+  EXPECT_TRUE(after.cancelled);
+
+  // Nothing submitted to the stopped executor runs either.
+  executor->Submit([token, ran] { ++*ran; }, 0);
+  executor->WaitUntilIdle();
+  EXPECT_EQ(ran->load(), 0);
+  EXPECT_EQ(token.use_count(), 1);
+
+  executor.reset();
+  RK_Death();
+  EXPECT_EQ(ran->load(), 0);
+}
+
+TEST(FrameLifecycle, NestedGuardsCountOnTheGlobalBag) {
+  RK_Birth(false);
+  boost::shared_ptr<RK_Bag> bag = RK_GlobalBag();
+  ASSERT_TRUE(bag);
+  EXPECT_EQ(RK_TEST_Access::LockHoldCount(*bag), 0u);
+  {
+    RK_ScCacheLock outer;
+    EXPECT_EQ(RK_TEST_Access::LockHoldCount(*bag), 1u);
+    {
+      RK_ScCacheLock middle;
+      {
+        RK_ScCacheLock inner;
+        EXPECT_EQ(RK_TEST_Access::LockHoldCount(*bag), 3u);
+        // The bag's own operations take the lock again on this thread.
+        EXPECT_EQ(bag->GetStuffCount(), 0u);
+      }
+      EXPECT_EQ(RK_TEST_Access::LockHoldCount(*bag), 2u);
+    }
+    EXPECT_EQ(RK_TEST_Access::LockHoldCount(*bag), 1u);
+  }
+  EXPECT_EQ(RK_TEST_Access::LockHoldCount(*bag), 0u);
+  RK_StopAllAsyncWork();
+  bag.reset();
+  RK_Death();
+}
+
+TEST(FrameLifecycle, ClockIsUniversalTimeWithMicroseconds) {
+  const boost::posix_time::ptime before = boost::posix_time::microsec_clock::universal_time();
+  const boost::posix_time::ptime now = RK_Now();
+  const boost::posix_time::ptime after = boost::posix_time::microsec_clock::universal_time();
+  EXPECT_LE(before, now);
+  EXPECT_LE(now, after);
+  // Not local time: the offset would put it outside the bracket above, and
+  // successive readings advance at microsecond resolution.
+  bool sawSubMillisecond = false;
+  for (int i = 0; i < 1000 && !sawSubMillisecond; ++i)
+    sawSubMillisecond = RK_Now().time_of_day().fractional_seconds() % 1000 != 0;
+  EXPECT_TRUE(sawSubMillisecond);
+}

@@ -1,0 +1,103 @@
+// Profiler scopes: a scope records only when conditional profiling is on at
+// or above its volume, and its log is created once.
+#include <gtest/gtest.h>
+
+#include <map>
+#include <stdexcept>
+#include <string>
+
+#include "plinth/debug.h"
+#include "rkcache/rkcache.h"
+#include "rkcache/testing.h"
+
+namespace {
+
+struct Scope {
+  const char* name;
+  int volume;
+};
+// In the order of RK_TEST_ProfileScope's indices.
+const Scope kScopes[8] = {
+    {"VX.render.RK_SortDir::AddStuff", 6},   {"VX.render.RK_Stuff::Checkin", 6},
+    {"VX.render.RK_Stuff::Checkout", 6},     {"VX.render.RK_SortDir::FindAndCheckout", 7},
+    {"VX.RK_Bag::GetCacheSizesInBytes", 9},  {"VX.render.RK_Stuff::PrepAndRead", 6},
+    {"VX.render.RK_Stuff::PrepAndWrite", 6}, {"VX.render.RK_SortDir::RemoveStuff", 6},
+};
+
+struct LogInfo {
+  int logs = 0;             // how many logs carry the name
+  std::uint64_t count = 0;  // intervals recorded in them
+  int volume = -1;
+};
+
+std::map<std::string, LogInfo> LogsByName() {
+  std::map<std::string, LogInfo> out;
+  for (const auto& log : plinth::debug::CodeProfilerManager::Get().Logs()) {
+    LogInfo& info = out[log->Name()];
+    ++info.logs;
+    info.count += log->Count();
+    info.volume = log->Volume();
+  }
+  return out;
+}
+
+void OpenEveryScope() {
+  for (int i = 0; i < 8; ++i) RK_TEST_ProfileScope(i);
+}
+
+}  // namespace
+
+TEST(FrameProfile, NoLogIsCreatedWhileConditionalProfilingIsOff) {
+  plinth::debug::CodeProfilerManager& manager = plinth::debug::CodeProfilerManager::Get();
+  manager.SetConditionalProfiling(false);
+  manager.SetProfilingVolume(9);
+  OpenEveryScope();
+  // On, but below every scope's volume.
+  manager.SetConditionalProfiling(true);
+  manager.SetProfilingVolume(5);
+  OpenEveryScope();
+  const auto logs = LogsByName();
+  for (const Scope& scope : kScopes) EXPECT_EQ(logs.count(scope.name), 0u) << scope.name;
+}
+
+TEST(FrameProfile, ScopesRecordAtOrAboveTheirVolumeIntoOneLogEach) {
+  plinth::debug::CodeProfilerManager& manager = plinth::debug::CodeProfilerManager::Get();
+  manager.SetConditionalProfiling(true);
+  manager.SetProfilingVolume(6);
+  OpenEveryScope();
+  auto logs = LogsByName();
+  for (const Scope& scope : kScopes) {
+    SCOPED_TRACE(scope.name);
+    if (scope.volume <= 6) {
+      ASSERT_EQ(logs.count(scope.name), 1u);
+      EXPECT_EQ(logs[scope.name].logs, 1);
+      EXPECT_EQ(logs[scope.name].count, 1u);
+      EXPECT_EQ(logs[scope.name].volume, scope.volume);
+    } else {
+      EXPECT_EQ(logs.count(scope.name), 0u);
+    }
+  }
+
+  // At 9 all eight record; the logs made at 6 are reused, not made again.
+  manager.SetProfilingVolume(9);
+  OpenEveryScope();
+  OpenEveryScope();
+  logs = LogsByName();
+  for (const Scope& scope : kScopes) {
+    SCOPED_TRACE(scope.name);
+    ASSERT_EQ(logs.count(scope.name), 1u);
+    EXPECT_EQ(logs[scope.name].logs, 1);
+    EXPECT_EQ(logs[scope.name].count, scope.volume <= 6 ? 3u : 2u);
+    EXPECT_EQ(logs[scope.name].volume, scope.volume);
+  }
+
+  // Switched off again: the logs stay but record nothing more.
+  manager.SetConditionalProfiling(false);
+  OpenEveryScope();
+  logs = LogsByName();
+  EXPECT_EQ(logs["VX.RK_Bag::GetCacheSizesInBytes"].count, 2u);
+  EXPECT_EQ(logs["VX.render.RK_Stuff::Checkout"].count, 3u);
+
+  EXPECT_THROW(RK_TEST_ProfileScope(8), std::invalid_argument);
+  EXPECT_THROW(RK_TEST_ProfileScope(-1), std::invalid_argument);
+}

@@ -1,0 +1,144 @@
+// The subclass factory registry: registration and replacement, exact
+// case-sensitive names, header bytes passed unchanged, and discarding by
+// RK_Stuff::Death and RK_Death.
+#include <gtest/gtest.h>
+
+#include <boost/make_shared.hpp>
+#include <stdexcept>
+#include <string>
+#include <vector>
+
+#include "rkcache/rkcache.h"
+#include "support/test_access.h"
+#include "support/test_stuff.h"
+
+namespace {
+
+// A factory that records the headers it was given and tags what it builds.
+struct RecordingFactory {
+  std::string tag;
+  boost::shared_ptr<std::vector<RK_HeaderBytes>> headers = boost::make_shared<std::vector<RK_HeaderBytes>>();
+
+  boost::intrusive_ptr<RK_Stuff> operator()(const RK_HeaderBytes& header) const {
+    headers->push_back(header);
+    return rktest::TestStuff::Make(1000, true, false, nullptr, tag);
+  }
+};
+
+std::string TagOf(const boost::intrusive_ptr<RK_Stuff>& item) {
+  auto* test = dynamic_cast<rktest::TestStuff*>(item.get());
+  return test ? test->Name() : std::string("<none>");
+}
+
+boost::intrusive_ptr<RK_Stuff> Create(const char* name, const RK_HeaderBytes& header = {}) {
+  return RK_TEST_Access::CreateSubclass(name, header);
+}
+
+}  // namespace
+
+TEST(Registry, AbsentUntilTheFirstRegistration) {
+  EXPECT_EQ(RK_TEST_Access::FactoryRegistry(), nullptr);
+  EXPECT_FALSE(Create("Frame"));
+  EXPECT_EQ(RK_TEST_Access::FactoryRegistry(), nullptr);  // a lookup creates nothing
+
+  RK_Birth(false);
+  EXPECT_EQ(RK_TEST_Access::FactoryRegistry(), nullptr);  // nor does birth
+  RK_StopAllAsyncWork();
+  RK_Death();
+}
+
+TEST(Registry, LaterRegistrationReplacesAndNamesMatchExactly) {
+  RecordingFactory first{"first"};
+  RecordingFactory second{"second"};
+  RecordingFactory lower{"lower"};
+
+  RK_Stuff::RegisterFactory("Frame", first);
+  EXPECT_EQ(TagOf(Create("Frame")), "first");
+  RK_Stuff::RegisterFactory("Frame", second);
+  EXPECT_EQ(TagOf(Create("Frame")), "second");
+  EXPECT_EQ(TagOf(Create("Frame")), "second");
+  EXPECT_EQ(first.headers->size(), 1u);
+  EXPECT_EQ(second.headers->size(), 2u);
+
+  // Letter case and length matter.
+  EXPECT_FALSE(Create("frame"));
+  EXPECT_FALSE(Create("FRAME"));
+  EXPECT_FALSE(Create("Frame "));
+  EXPECT_FALSE(Create("Fram"));
+  RK_Stuff::RegisterFactory("frame", lower);
+  EXPECT_EQ(TagOf(Create("frame")), "lower");
+  EXPECT_EQ(TagOf(Create("Frame")), "second");
+  EXPECT_EQ(RK_TEST_Access::FactoryRegistry()->size(), 2u);
+
+  RK_Stuff::Death();
+}
+
+TEST(Registry, HeaderBytesReachTheFactoryUnchanged) {
+  RecordingFactory factory{"item"};
+  RK_Stuff::RegisterFactory("Frame", factory);
+
+  RK_HeaderBytes bytes;
+  for (int i = 0; i < 300; ++i) bytes.push_back(static_cast<unsigned char>(i * 7));
+  bytes.push_back(0);
+  bytes.push_back(0xFF);
+  ASSERT_TRUE(Create("Frame", bytes));
+  ASSERT_TRUE(Create("Frame", RK_HeaderBytes{}));
+  ASSERT_EQ(factory.headers->size(), 2u);
+  EXPECT_EQ((*factory.headers)[0], bytes);
+  EXPECT_TRUE((*factory.headers)[1].empty());
+
+  RK_Stuff::Death();
+}
+
+TEST(Registry, EmptyOrNullFactoriesYieldNullAndFactoryErrorsPassThrough) {
+  RK_Stuff::RegisterFactory("Empty", RK_Factory());
+  EXPECT_FALSE(Create("Empty"));
+
+  RK_Stuff::RegisterFactory("Null", [](const RK_HeaderBytes&) { return boost::intrusive_ptr<RK_Stuff>(); });
+  EXPECT_FALSE(Create("Null"));
+
+  RK_Stuff::RegisterFactory("Rejects", [](const RK_HeaderBytes& header) -> boost::intrusive_ptr<RK_Stuff> {
+    if (header.empty()) throw std::invalid_argument("empty header");
+    throw 0x3A07;
+  });
+  EXPECT_THROW(Create("Rejects"), std::invalid_argument);
+  try {
+    Create("Rejects", RK_HeaderBytes{1});
+    ADD_FAILURE() << "nothing thrown";
+  } catch (int code) {
+    EXPECT_EQ(code, 0x3A07);
+  }
+
+  RK_Stuff::Death();
+}
+
+TEST(Registry, DeathDiscardsTheCopiesAndRegistrationStartsAfresh) {
+  RecordingFactory factory{"old"};
+  const long before = factory.headers.use_count();
+  RK_Stuff::RegisterFactory("Frame", factory);
+  RK_Stuff::RegisterFactory("Other", factory);
+  // The registry holds copies of its own.
+  EXPECT_EQ(factory.headers.use_count(), before + 2);
+
+  RK_Stuff::Death();
+  EXPECT_EQ(RK_TEST_Access::FactoryRegistry(), nullptr);
+  EXPECT_EQ(factory.headers.use_count(), before);
+  EXPECT_FALSE(Create("Frame"));
+  RK_Stuff::Death();  // a second discard finds nothing to do
+  EXPECT_EQ(RK_TEST_Access::FactoryRegistry(), nullptr);
+
+  RecordingFactory fresh{"fresh"};
+  RK_Stuff::RegisterFactory("Frame", fresh);
+  EXPECT_EQ(TagOf(Create("Frame")), "fresh");
+  EXPECT_FALSE(Create("Other"));
+  EXPECT_EQ(RK_TEST_Access::FactoryRegistry()->size(), 1u);
+  EXPECT_TRUE(factory.headers->empty());
+
+  // Module shut-down discards it the same way.
+  RK_Birth(false);
+  RK_StopAllAsyncWork();
+  RK_Death();
+  EXPECT_EQ(RK_TEST_Access::FactoryRegistry(), nullptr);
+  EXPECT_EQ(fresh.headers.use_count(), 1);
+  EXPECT_FALSE(Create("Frame"));
+}
