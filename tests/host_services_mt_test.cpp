@@ -100,12 +100,11 @@ TEST(HostServicesConcurrency, ControlsChangeWhileServicesAreUsed) {
   ASSERT_EQ(0, HK_GetComputerName(sizeof systemName, systemName));
 
   std::atomic<bool> stop{false};
-  std::atomic<int> sinkLines{0};
   std::thread changer([&] {
     for (int i = 0; i < 300; ++i) {
       ctl::SetComputerName(std::string("host-") + std::to_string(i));
       ctl::SetPreference("S", "K", std::to_string(i));
-      ctl::SetLogSink([&sinkLines](const std::string&) { ++sinkLines; });
+      ctl::SetLogSink([](const std::string&) {});
       ctl::MakeCurrentThreadMain();
     }
     stop = true;
@@ -134,7 +133,6 @@ TEST(HostServicesConcurrency, ControlsChangeWhileServicesAreUsed) {
 
   EXPECT_EQ(0, badReads.load());
   EXPECT_EQ(static_cast<std::size_t>(logged.load()), ctl::Snapshot().logLines.size());
-  EXPECT_LE(sinkLines.load(), logged.load());
   ctl::SetLogSink({});
   ctl::SetComputerName(std::nullopt);
   ctl::ClearPreferences();

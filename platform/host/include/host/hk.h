@@ -106,10 +106,13 @@ HK_API int HK_GetMemoryStat(int selector, std::uint64_t* value);
 // Tracked allocation: adds to / subtracts from statistic 6, which never
 // goes below 0. HK_TrackedAlloc throws std::bad_alloc like operator new.
 HK_API void* HK_TrackedAlloc(std::size_t bytes);
+// REQUIRES: p is null or came from HK_TrackedAlloc(bytes) with the same count.
 HK_API void HK_TrackedFree(void* p, std::size_t bytes) noexcept;
 HK_API void HK_TrackBytes(std::int64_t delta);
 
-// Base for objects allocated through tracked allocation.
+// Base for objects allocated through tracked allocation. The sized delete
+// takes back the size of the whole object, so a class deleted through a
+// base pointer needs a virtual destructor.
 class HK_API HK_MemTrackedObject {
  public:
   static void* operator new(std::size_t bytes);
