@@ -1,0 +1,161 @@
+// Cache file identity and deletion: handing out an item's file, deleting it
+// with the bag's total, the change counter and the main-thread notification.
+// Deletion is private to the module; it is reached here the way the module
+// reaches it: a conversion to writeable makes the cached copy stale.
+#include <gtest/gtest.h>
+
+#include <boost/date_time/posix_time/posix_time.hpp>
+#include <string>
+#include <thread>
+#include <vector>
+
+#include "host/control.h"
+#include "rkcache/rkcache.h"
+#include "support/file_stuff.h"
+#include "support/temp_dir.h"
+#include "support/test_access.h"
+#include "support/test_stuff.h"
+
+namespace {
+
+using boost::posix_time::time_duration;
+using rktest::Journal;
+using rktest::TestStuff;
+using rktest::TestStuffPtr;
+
+class IdentityTest : public ::testing::Test {
+ protected:
+  // Deletes the item's cache file through a conversion to writeable, and
+  // ends that check-out keeping the item's last use.
+  static void DeleteCacheFile(RK_Stuff& item) {
+    ASSERT_EQ(item.Checkout(RK_Checkout_ReadOnly | RK_Checkout_EvenIfNotInMemory),
+              RK_CheckoutResult_CheckedOut);
+    item.ConvertToWriteable();
+    item.Checkin(RK_Checkin_KeepLastUse, time_duration());
+  }
+
+  void SetUp() override {
+    rkhost::control::MakeCurrentThreadMain();
+    RK_Birth(false);
+    rkhost::control::ClearCaptured();
+    bag = RK_GlobalBag();
+    dir = RK_GlobalSortDir();
+    journal = std::make_shared<Journal>();
+  }
+  void TearDown() override {
+    bag.reset();
+    dir.reset();
+    RK_StopAllAsyncWork();
+    RK_Death();
+  }
+  TestStuffPtr EnterWithFile(const std::string& name, std::size_t bytes) {
+    TestStuffPtr item = TestStuff::Make(static_cast<std::uint32_t>(bytes), true, false, journal, name);
+    item->AddToBagAndSortDir(bag, time_duration());
+    RK_TEST_Access::SetDiskCacheFile(
+        *item, rktest::WriteFile(folder, name + ".vxcache", rktest::CountingBytes(bytes)));
+    return item;
+  }
+
+  rktest::TempDir folder;
+  boost::shared_ptr<RK_Bag> bag;
+  boost::shared_ptr<RK_SortDir> dir;
+  std::shared_ptr<Journal> journal;
+};
+
+TEST_F(IdentityTest, GetDiskCacheFileCopiesTheFileOrGivesAnEmptyOne) {
+  TestStuffPtr none = TestStuff::Make();
+  EXPECT_TRUE(none->GetDiskCacheFile().IsEmpty());
+  none->SetOnDisk(true);  // claims to be on disk without holding a file
+  EXPECT_TRUE(none->GetDiskCacheFile().IsEmpty());
+
+  TestStuffPtr item = EnterWithFile("a", 10);
+  const plinth::filesupport::File file = item->GetDiskCacheFile();
+  EXPECT_EQ(file.FullPath(), plinth::utility::UTF8to16(folder.Path() + "/a.vxcache"));
+  EXPECT_TRUE(file.Exists());
+  item->SetOnDisk(false);  // the virtual decides
+  EXPECT_TRUE(item->GetDiskCacheFile().IsEmpty());
+}
+
+TEST_F(IdentityTest, DeletionRemovesTheFileUnchargesItsSizeAndCountsAChange) {
+  TestStuffPtr item = EnterWithFile("a", 4096);
+  RK_TEST_Access::SetDiskCacheSize(*bag, 10000);
+  const plinth::filesupport::File file = item->GetDiskCacheFile();
+  const auto changes = dir->GetLastChangeTime();
+
+  DeleteCacheFile(*item);
+  EXPECT_FALSE(file.Exists());
+  EXPECT_FALSE(item->IsOnDisk());
+  EXPECT_EQ(bag->GetCurrentDiskCacheSize(), 10000 - 4096);
+  // Leaving the directory, the deletion, and coming back.
+  EXPECT_EQ(dir->GetLastChangeTime(), changes + 3);
+  EXPECT_EQ(journal->Events(), (std::vector<std::string>{"a:YourDiskCacheFileWasDeleted"}));
+
+  // Nothing left to delete: the deletion changes nothing.
+  DeleteCacheFile(*item);
+  EXPECT_EQ(bag->GetCurrentDiskCacheSize(), 10000 - 4096);
+  EXPECT_EQ(dir->GetLastChangeTime(), changes + 5);
+  EXPECT_EQ(journal->Count("a:YourDiskCacheFileWasDeleted"), 1);
+}
+
+TEST_F(IdentityTest, OnlyTheMainThreadNotifiesTheItem) {
+  TestStuffPtr a = EnterWithFile("a", 100);
+  TestStuffPtr b = EnterWithFile("b", 100);
+  RK_TEST_Access::SetDiskCacheSize(*bag, 200);
+  const plinth::filesupport::File fileA = a->GetDiskCacheFile();
+  const auto changes = dir->GetLastChangeTime();
+  for (bool render : {true, false}) {
+    std::thread other([&, render] {
+      rkhost::control::SetCurrentThreadIsRenderThread(render);
+      DeleteCacheFile(render ? *a : *b);
+    });
+    other.join();
+  }
+  EXPECT_FALSE(fileA.Exists());
+  EXPECT_FALSE(a->IsOnDisk());
+  EXPECT_FALSE(b->IsOnDisk());
+  EXPECT_EQ(bag->GetCurrentDiskCacheSize(), 0);
+  EXPECT_EQ(dir->GetLastChangeTime(), changes + 6);
+  EXPECT_TRUE(journal->Events().empty());
+}
+
+TEST_F(IdentityTest, FailuresToMeasureOrDeleteAreSwallowedAndAnOrphanedItemStillLosesItsFile) {
+  // The file vanished behind the module's back: nothing to measure or
+  // delete, but the item loses its link and nothing is un-charged.
+  TestStuffPtr a = EnterWithFile("a", 100);
+  RK_TEST_Access::SetDiskCacheSize(*bag, 500);
+  const plinth::filesupport::File file = a->GetDiskCacheFile();
+  file.Delete();
+  DeleteCacheFile(*a);
+  EXPECT_FALSE(a->IsOnDisk());
+  EXPECT_EQ(bag->GetCurrentDiskCacheSize(), 500);
+  EXPECT_EQ(journal->Count("a:YourDiskCacheFileWasDeleted"), 1);
+  EXPECT_TRUE(rkhost::control::Snapshot().exceptions.empty());
+
+  // An item whose bag is gone still has its file deleted.
+  TestStuffPtr orphan = TestStuff::Make(10, true, false, journal, "o");
+  {
+    boost::shared_ptr<RK_Bag> other(new RK_Bag);
+    other->AddStuff(orphan);
+  }
+  EXPECT_FALSE(orphan->GetBag());
+  auto orphanFile = rktest::WriteFile(folder, "o.vxcache", rktest::CountingBytes(10));
+  RK_TEST_Access::SetDiskCacheFile(*orphan, orphanFile);
+  DeleteCacheFile(*orphan);
+  EXPECT_FALSE(orphanFile->Exists());
+  EXPECT_FALSE(orphan->IsOnDisk());
+  EXPECT_EQ(bag->GetCurrentDiskCacheSize(), 500);
+}
+
+TEST_F(IdentityTest, ConvertToWriteableDeletesTheNowStaleCacheFile) {
+  TestStuffPtr a = EnterWithFile("a", 256);
+  RK_TEST_Access::SetDiskCacheSize(*bag, 256);
+  const plinth::filesupport::File file = a->GetDiskCacheFile();
+  RK_ScCheckout receipt(a.get(), RK_Checkout_ReadOnly);
+  a->ConvertToWriteable();
+  EXPECT_FALSE(file.Exists());
+  EXPECT_FALSE(a->IsOnDisk());
+  EXPECT_EQ(bag->GetCurrentDiskCacheSize(), 0);
+  EXPECT_TRUE(a->IsCheckedOutWriteable());
+}
+
+}  // namespace

@@ -1,0 +1,300 @@
+// Receipts: checking in on reuse and destruction, release, swap, errors in
+// the destructor, the was-on-disk flag, and copies sharing one check-out.
+#include <gtest/gtest.h>
+
+#include <boost/date_time/posix_time/posix_time.hpp>
+#include <string>
+#include <thread>
+#include <utility>
+#include <vector>
+
+#include "host/control.h"
+#include "rkcache/rkcache.h"
+#include "support/file_stuff.h"
+#include "support/temp_dir.h"
+#include "support/test_access.h"
+#include "support/test_stuff.h"
+
+namespace {
+
+using boost::posix_time::time_duration;
+using rktest::Journal;
+using rktest::TestStuff;
+using rktest::TestStuffPtr;
+
+constexpr int kReadOnly = RK_Checkout_ReadOnly;
+
+class ReceiptTest : public ::testing::Test {
+ protected:
+  void SetUp() override {
+    rkhost::control::MakeCurrentThreadMain();
+    RK_Birth(false);
+    rkhost::control::ClearCaptured();
+    bag = RK_GlobalBag();
+    dir = RK_GlobalSortDir();
+  }
+  void TearDown() override {
+    bag.reset();
+    dir.reset();
+    RK_StopAllAsyncWork();
+    RK_Death();
+  }
+  template <class T>
+  boost::intrusive_ptr<T> Enter(boost::intrusive_ptr<T> item) {
+    item->AddToBagAndSortDir(bag, time_duration());
+    return item;
+  }
+
+  boost::shared_ptr<RK_Bag> bag;
+  boost::shared_ptr<RK_SortDir> dir;
+};
+
+TEST_F(ReceiptTest, ChecksInOnReuseAndDestructionButNotAfterAFailedCheckout) {
+  TestStuffPtr a = Enter(TestStuff::Make());
+  TestStuffPtr b = Enter(TestStuff::Make());
+  {
+    RK_ScCheckout empty;
+    EXPECT_FALSE(empty.DidCheckout());
+    EXPECT_EQ(empty.GetResult(), RK_CheckoutResult_NotCheckedOut);
+    EXPECT_EQ(empty.GetStuff(), nullptr);
+    EXPECT_FALSE(empty.IsOnDisk());
+    EXPECT_FALSE(empty.IsInMemory());
+  }
+  {
+    RK_ScCheckout receipt(a.get(), kReadOnly);
+    EXPECT_TRUE(receipt.DidCheckout());
+    EXPECT_TRUE(receipt.IsInMemory());
+    EXPECT_EQ(receipt.GetStuff(), a.get());
+    EXPECT_EQ(a->GetCheckoutCount(), 1u);
+
+    // Reuse on the same item checks the first check-out in first.
+    EXPECT_EQ(receipt.Checkout(a.get(), kReadOnly), RK_CheckoutResult_CheckedOut);
+    EXPECT_EQ(a->GetCheckoutCount(), 1u);
+    // ...and on another item too.
+    EXPECT_EQ(receipt.Checkout(b.get(), kReadOnly), RK_CheckoutResult_CheckedOut);
+    EXPECT_EQ(a->GetCheckoutCount(), 0u);
+    EXPECT_EQ(b->GetCheckoutCount(), 1u);
+    EXPECT_EQ(receipt.GetStuff(), b.get());
+
+    // A lookup through the global directory, after checking b in.
+    EXPECT_EQ(receipt.FindAndCheckout(a.get(), kReadOnly), RK_CheckoutResult_CheckedOut);
+    EXPECT_EQ(b->GetCheckoutCount(), 0u);
+    EXPECT_EQ(a->GetCheckoutCount(), 1u);
+    EXPECT_EQ(receipt.GetStuff(), a.get());
+  }
+  EXPECT_EQ(a->GetCheckoutCount(), 0u);
+  EXPECT_EQ(a->RefCountForDiagnostics(), 2u);
+
+  // Flags the item cannot meet: nothing held, nothing checked in later.
+  a->SetInMemory(false);
+  {
+    RK_ScCheckout receipt(a.get(), kReadOnly | RK_Checkout_OnlyIfInMemory);
+    EXPECT_FALSE(receipt.DidCheckout());
+    EXPECT_EQ(receipt.GetStuff(), nullptr);
+    a->SetInMemory(true);
+    ASSERT_EQ(a->Checkout(kReadOnly), RK_CheckoutResult_CheckedOut);  // someone else's
+  }
+  EXPECT_EQ(a->GetCheckoutCount(), 1u);
+  a->Checkin(0, time_duration());
+
+  // Checkin passes its flags and empties the receipt; a second Checkin does nothing.
+  RK_ScCheckout receipt(a.get(), kReadOnly);
+  receipt.Checkin(RK_Checkin_Discard, time_duration());
+  EXPECT_FALSE(receipt.DidCheckout());
+  EXPECT_EQ(receipt.GetStuff(), nullptr);
+  EXPECT_FALSE(a->GetBag());
+  receipt.Checkin(0, time_duration());
+  EXPECT_EQ(a->GetCheckoutCount(), 0u);
+
+  // Without a global directory nothing is found.
+  RK_StopAllAsyncWork();
+  dir.reset();
+  RK_Death();
+  EXPECT_EQ(receipt.FindAndCheckout(b.get(), kReadOnly), RK_CheckoutResult_NotCheckedOut);
+  RK_Birth(false);
+}
+
+TEST_F(ReceiptTest, ReleaseHandsTheCheckoutOverAndSwapMovesIt) {
+  auto journal = std::make_shared<Journal>();
+  TestStuffPtr a = Enter(TestStuff::Make(10, true, false, journal, "a"));
+  RK_Stuff* released = nullptr;
+  {
+    RK_ScCheckout receipt(a.get(), kReadOnly);
+    released = receipt.Release();
+    EXPECT_EQ(released, a.get());
+    EXPECT_FALSE(receipt.DidCheckout());
+    EXPECT_EQ(receipt.GetStuff(), a.get());      // still named, and still referenced
+    EXPECT_EQ(a->RefCountForDiagnostics(), 4u);  // test, directory, check-out, receipt
+  }
+  EXPECT_EQ(a->GetCheckoutCount(), 1u);  // the destructor did not check in
+  released->Checkin(0, time_duration());
+  EXPECT_EQ(a->GetCheckoutCount(), 0u);
+
+  RK_ScCheckout holder(a.get(), kReadOnly);
+  {
+    RK_ScCheckout empty;
+    empty.Swap(holder);
+    EXPECT_TRUE(empty.DidCheckout());
+    EXPECT_FALSE(holder.DidCheckout());
+    EXPECT_EQ(holder.GetStuff(), nullptr);
+  }
+  EXPECT_EQ(a->GetCheckoutCount(), 0u);  // checked in once, by the new holder
+
+  // A move transfers the check-out and leaves the source empty.
+  RK_ScCheckout first(a.get(), kReadOnly);
+  RK_ScCheckout moved(std::move(first));
+  EXPECT_FALSE(first.DidCheckout());  // NOLINT(bugprone-use-after-move): a moved-from receipt is empty
+  EXPECT_TRUE(moved.DidCheckout());
+  RK_ScCheckout target;
+  target = std::move(moved);
+  EXPECT_EQ(a->GetCheckoutCount(), 1u);
+  target = RK_ScCheckout();  // lets go of the check-out
+  EXPECT_EQ(a->GetCheckoutCount(), 0u);
+}
+
+TEST_F(ReceiptTest, CopiesShareOneCheckoutAndCheckItInOnce) {
+  TestStuffPtr a = Enter(TestStuff::Make());
+  TestStuffPtr b = Enter(TestStuff::Make());
+  {
+    RK_ScCheckout original(a.get(), kReadOnly);
+    {
+      RK_ScCheckout copy(original);
+      RK_ScCheckout another = copy;
+      EXPECT_TRUE(copy.DidCheckout());
+      EXPECT_TRUE(another.DidCheckout());
+      EXPECT_EQ(copy.GetStuff(), a.get());
+      EXPECT_EQ(a->GetCheckoutCount(), 1u);
+    }
+    EXPECT_EQ(a->GetCheckoutCount(), 1u);  // the original still holds it
+    EXPECT_TRUE(original.DidCheckout());
+  }
+  EXPECT_EQ(a->GetCheckoutCount(), 0u);
+
+  // Check-in through one copy only lets go of its share; the last one to
+  // let go checks in, with its own flags.
+  {
+    RK_ScCheckout original(a.get(), kReadOnly);
+    RK_ScCheckout copy(original);
+    original.Checkin(RK_Checkin_Discard, time_duration());
+    EXPECT_FALSE(original.DidCheckout());
+    EXPECT_EQ(a->GetCheckoutCount(), 1u);
+    EXPECT_TRUE(a->GetBag());
+    copy.Checkin(RK_Checkin_KeepLastUse, time_duration());
+    EXPECT_EQ(a->GetCheckoutCount(), 0u);
+    EXPECT_TRUE(a->GetBag());  // kept: the last holder did not discard
+  }
+
+  // Assignment lets go of what the target held, then shares the source's.
+  {
+    RK_ScCheckout onA(a.get(), kReadOnly);
+    RK_ScCheckout onB(b.get(), kReadOnly);
+    onB = onA;
+    EXPECT_EQ(b->GetCheckoutCount(), 0u);
+    EXPECT_EQ(a->GetCheckoutCount(), 1u);
+    onB = onB;  // self-assignment keeps the share
+    EXPECT_TRUE(onB.DidCheckout());
+    onA = RK_ScCheckout();
+    EXPECT_EQ(a->GetCheckoutCount(), 1u);
+  }
+  EXPECT_EQ(a->GetCheckoutCount(), 0u);
+
+  // Release from one copy takes the check-out away from every copy.
+  RK_Stuff* released = nullptr;
+  {
+    RK_ScCheckout original(a.get(), kReadOnly);
+    RK_ScCheckout copy(original);
+    released = copy.Release();
+    EXPECT_FALSE(copy.DidCheckout());
+    EXPECT_FALSE(original.DidCheckout());
+    EXPECT_FALSE(RK_ScCheckout(original).DidCheckout());
+  }
+  EXPECT_EQ(a->GetCheckoutCount(), 1u);
+  released->Checkin(0, time_duration());
+
+  // Copies on two threads let go at the same time: exactly one check-in.
+  for (int round = 0; round < 50; ++round) {
+    auto* original = new RK_ScCheckout(a.get(), kReadOnly);
+    RK_ScCheckout copy(*original);
+    std::thread other([original] { delete original; });
+    copy.Checkin(0, time_duration());
+    other.join();
+    ASSERT_EQ(a->GetCheckoutCount(), 0u);
+  }
+  EXPECT_TRUE(rkhost::control::Snapshot().errorReports.empty());
+}
+
+TEST_F(ReceiptTest, WasOnDiskAndEnsureInMemory) {
+  rktest::TempDir folder;
+  auto item = Enter(rktest::FileStuff::Make(64));
+  RK_TEST_Access::SetDiskCacheFile(*item, rktest::WriteFile(folder, "r.vxcache", rktest::CountingBytes(64)));
+  {
+    RK_ScCheckout receipt(item.get(), kReadOnly);
+    ASSERT_TRUE(receipt.DidCheckout());
+    EXPECT_TRUE(receipt.IsInMemory());
+    EXPECT_TRUE(receipt.IsOnDisk());
+    // Still true once the item's file is gone: it was on disk when tried.
+    RK_TEST_Access::SetDiskCacheFile(*item, nullptr);
+    EXPECT_TRUE(receipt.IsOnDisk());
+    receipt.Checkin(0, time_duration());
+    EXPECT_FALSE(receipt.IsOnDisk());
+  }
+
+  // EnsureInMemory empties a receipt whose item cannot be brought in.
+  auto gone = Enter(TestStuff::Make(10, false));
+  gone->SetOnDisk(true);
+  RK_ScCheckout receipt(gone.get(), kReadOnly | RK_Checkout_DontRead);
+  ASSERT_TRUE(receipt.DidCheckout());
+  EXPECT_TRUE(receipt.IsOnDisk());
+  receipt.EnsureInMemory();
+  EXPECT_FALSE(receipt.DidCheckout());
+  EXPECT_EQ(gone->GetCheckoutCount(), 0u);
+  // A failed check-out still records whether the item was on disk.
+  EXPECT_EQ(receipt.Checkout(gone.get(), kReadOnly | RK_Checkout_OnlyIfInMemory),
+            RK_CheckoutResult_NotCheckedOut);
+  EXPECT_TRUE(receipt.IsOnDisk());
+}
+
+TEST_F(ReceiptTest, ConflictsLeaveTheReceiptEmptyAndTheDestructorSwallowsCheckinErrors) {
+  TestStuffPtr a = Enter(TestStuff::Make());
+  RK_ScCheckout writer(a.get(), 0);
+  int code = 0;
+  try {
+    RK_ScCheckout reader(a.get(), kReadOnly);
+  } catch (int c) {
+    code = c;
+  }
+  EXPECT_EQ(code, 0x3A03);
+  // A writeable lookup whose match is held: the conflict leaves the
+  // receipt empty, and what it held before was checked in first.
+  TestStuffPtr b = Enter(TestStuff::Make());
+  RK_ScCheckout holdsB(b.get(), kReadOnly);
+  RK_ScCheckout reader(b.get(), kReadOnly);
+  EXPECT_EQ(b->GetCheckoutCount(), 2u);
+  code = 0;
+  try {
+    reader.FindAndCheckout(b.get(), 0);
+  } catch (int c) {
+    code = c;
+  }
+  EXPECT_EQ(code, 0x3A03);
+  EXPECT_FALSE(reader.DidCheckout());
+  EXPECT_EQ(b->GetCheckoutCount(), 1u);
+  EXPECT_EQ(a->GetCheckoutCount(), 1u);
+  EXPECT_EQ(rkhost::control::Snapshot().errorReports.size(), 2u);  // messages 11 and 12, main thread
+  writer.Release()->Checkin(0, time_duration());
+
+  // The check-out is ended behind the receipt's back, so its destructor's
+  // check-in fails: on a render thread, with no report and nothing thrown.
+  rkhost::control::ClearCaptured();
+  std::thread other([&] {
+    rkhost::control::SetCurrentThreadIsRenderThread(true);
+    RK_ScCheckout held(a.get(), kReadOnly);
+    a->Checkin(0, time_duration());
+  });
+  other.join();
+  EXPECT_EQ(a->GetCheckoutCount(), 0u);
+  EXPECT_TRUE(rkhost::control::Snapshot().errorReports.empty());
+  EXPECT_TRUE(rkhost::control::Snapshot().exceptions.empty());
+}
+
+}  // namespace
