@@ -50,8 +50,8 @@ class RK_EXPORT ReadAheadInfo : private boost::noncopyable {
   void UnRegisterCancelOutstandingRequestsCallback(void* key);
 
  private:
-  ReadAheadInfo();
-  static void CreateInstance();
+  RK_INTERNAL ReadAheadInfo();
+  RK_INTERNAL static void CreateInstance();
 
   std::atomic<int> mDoReadAhead{0};
   std::atomic<int> mReadAheadSkipInterval{1};
@@ -62,8 +62,8 @@ class RK_EXPORT ReadAheadInfo : private boost::noncopyable {
   mutable boost::recursive_mutex mMutex;
   std::map<void*, boost::function<void()>> mCancelCallbacks;  // mMutex
 
-  static boost::shared_ptr<ReadAheadInfo> mInstance;
-  static boost::once_flag mOnceFlag;
+  RK_INTERNAL static boost::shared_ptr<ReadAheadInfo> mInstance;
+  RK_INTERNAL static boost::once_flag mOnceFlag;
 };
 
 }  // namespace rk

@@ -102,9 +102,9 @@ class RK_EXPORT RK_Stuff : public plinth::utility::RefCountedObject {
 
   // Check-out state checks for the holder's code. Each reports on the main
   // thread and throws on failure (see errors.h).
-  void ThrowIfCheckedOutLessThan(int n) const;   // 0x3A04, message 22
-  void ThrowIfCheckedOutMoreThan(int n) const;   // 0x3A03, message 12
-  void ThrowIfCheckedOutWriteable() const;       // 0x3A03, message 11
+  void ThrowIfCheckedOutLessThan(int n) const;  // 0x3A04, message 22
+  void ThrowIfCheckedOutMoreThan(int n) const;  // 0x3A03, message 12
+  void ThrowIfCheckedOutWriteable() const;      // 0x3A03, message 11
 
   static RK_FactoryMap* S_factory_funcsP;  // null until the first registration
 
@@ -117,21 +117,22 @@ class RK_EXPORT RK_Stuff : public plinth::utility::RefCountedObject {
   // Binds the private write job (diskcache/background_write.h).
   friend bool RKp_QueueBackgroundWrite(const boost::intrusive_ptr<RK_Stuff>& stuff);
 
-  void TempRemoveFromSortDir();
+  // Internal helpers without a test hook stay out of the exported interface.
+  RK_INTERNAL void TempRemoveFromSortDir();
   bool FreeUpAsMuchAsPossible();
   bool WorthWritingToDiskCache(const boost::posix_time::time_duration& computeTime);
   static boost::intrusive_ptr<RK_Stuff> CreateSubclass(const char* matchName, const RK_HeaderBytes& header);
 
   // Disk cache I/O: reads the payload from the cache file; deletes the cache
   // file (un-charging its size); the body of a background write job.
-  void PrepAndRead();
-  void DeleteDiskCacheFile();
-  void WriteToDiskAsync(boost::intrusive_ptr<RK_Stuff> self);
+  RK_INTERNAL void PrepAndRead();
+  RK_INTERNAL void DeleteDiskCacheFile();
+  RK_INTERNAL void WriteToDiskAsync(boost::intrusive_ptr<RK_Stuff> self);
 
-  plinth::utility::Guid guid;                                  // set before entering the cache
-  std::atomic<std::uint32_t> checkoutCount{0};                 // written under the cache lock
-  std::atomic<bool> checkedOutWriteable{false};                // written under the cache lock or by the sole holder
-  boost::posix_time::ptime lastUseTime;                        // cache lock; never changed while in a bag's set
+  plinth::utility::Guid guid;                    // set before entering the cache
+  std::atomic<std::uint32_t> checkoutCount{0};   // written under the cache lock
+  std::atomic<bool> checkedOutWriteable{false};  // written under the cache lock or by the sole holder
+  boost::posix_time::ptime lastUseTime;          // cache lock; never changed while in a bag's set
   boost::shared_ptr<plinth::filesupport::File> diskCacheFile;  // cache lock
   boost::weak_ptr<RK_Bag> bag;                                 // cache lock
   RK_StuffByLastUse::iterator bagPosition;                     // cache lock; meaningful while bag is set
