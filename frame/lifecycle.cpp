@@ -15,6 +15,7 @@
 
 #include <boost/date_time/posix_time/posix_time_types.hpp>
 #include <boost/make_shared.hpp>
+#include <chrono>
 
 #include "diskcache/pacing.h"
 #include "frame/globals.h"
@@ -108,8 +109,15 @@ boost::shared_ptr<plinth::threads::QueueOnlyOnce> RKp_ResumeWritesQueue() {
   return boost::atomic_load(&RK_G_resumeWritesQueue);
 }
 
+// UTC with microsecond resolution, as microsec_clock::universal_time gives,
+// but by plain arithmetic from the epoch: that clock converts through
+// gmtime_r, which takes the C library's process-wide time-zone lock on
+// every call, and check-in reads the clock on every use of an item.
 boost::posix_time::ptime RK_Now() {
-  return boost::posix_time::microsec_clock::universal_time();
+  static const boost::posix_time::ptime epoch(boost::gregorian::date(1970, 1, 1));
+  const auto sinceEpoch = std::chrono::system_clock::now().time_since_epoch();
+  return epoch + boost::posix_time::microseconds(
+                     std::chrono::duration_cast<std::chrono::microseconds>(sinceEpoch).count());
 }
 
 // The bag is fetched after the lock is taken: its lock-hold count is guarded

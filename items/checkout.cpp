@@ -166,11 +166,16 @@ void RK_Stuff::Checkin(int flags, const boost::posix_time::time_duration& cost) 
 
     if (restamp && !clockError) {
       if (boost::shared_ptr<RK_Bag> owner = bag.lock()) {
-        // The bag's ordering key may only change while the item is out of
-        // its set; the bag reuses the node, so this allocates nothing.
-        owner->RemoveStuffGuts(this);
+        // The bag's remove-and-add, done on its set directly: the item's
+        // own link names the bag, so the bag's membership checks cannot
+        // fail here, and the link itself stays as it is. The ordering key
+        // changes only while the element is out of the set; the extracted
+        // node goes back in, so nothing is allocated, and the hint at the
+        // young end makes the insertion amortised constant time.
+        RK_StuffByLastUse& order = owner->stuffByLastUse;
+        RK_StuffByLastUse::node_type node = order.extract(bagPosition);
         lastUseTime = now;
-        owner->AddStuffGuts(checkoutRef);
+        bagPosition = order.insert(order.end(), std::move(node));
       } else {
         lastUseTime = now;
       }

@@ -15,7 +15,22 @@
 namespace {
 
 // Groups are small (usually one item); larger ones spill to the heap.
-using Candidates = boost::container::small_vector<boost::intrusive_ptr<RK_Stuff>, 4>;
+using Candidates = boost::container::small_vector<RK_Stuff*, 4>;
+
+// The request as a lookup key without a reference of its own: hashing and
+// equality look only at the GUID, and the caller holds a reference for the
+// whole call. Detached, not released, on every way out.
+class BorrowedKey {
+ public:
+  explicit BorrowedKey(const RK_Stuff* request) : key_(const_cast<RK_Stuff*>(request), false) {}
+  ~BorrowedKey() { key_.detach(); }
+  BorrowedKey(const BorrowedKey&) = delete;
+  BorrowedKey& operator=(const BorrowedKey&) = delete;
+  const boost::intrusive_ptr<RK_Stuff>& Get() const { return key_; }
+
+ private:
+  boost::intrusive_ptr<RK_Stuff> key_;
+};
 
 }  // namespace
 
@@ -23,38 +38,40 @@ RK_CheckoutResult RK_SortDir::FindAndCheckout(const RK_Stuff* request, int flags
                                               bool* wasOnDisk) {
   RK_PROFILE_SCOPE(RKp_Profile_SortDirFindAndCheckout);
   RK_ScCacheLock lock;
-  // The call's own reference to the request, which is also the lookup key:
-  // hashing and equality look only at the GUID. Released before the lock.
-  const boost::intrusive_ptr<RK_Stuff> key(const_cast<RK_Stuff*>(request));
+  const BorrowedKey key(request);
   *found = nullptr;
 
-  const auto range = stuffByGuid.equal_range(key);
+  const auto range = stuffByGuid.equal_range(key.Get());
   if (range.first == range.second) return RK_CheckoutResult_NotCheckedOut;
 
-  // The walk works on a copy of the group: checking a candidate out may
-  // change the directory (a failed read-back deletes a cache file; item
-  // callbacks may re-enter the cache and add or drop items), which would
-  // invalidate iterators.
-  // The references keep every candidate alive until the walk is over.
-  const Candidates candidates(range.first, range.second);
+  // The walk works on a copy of the group: asking or checking out a
+  // candidate may change the directory (a failed read-back deletes a cache
+  // file; item callbacks may re-enter the cache and add or drop items),
+  // which would invalidate iterators. The copy holds plain pointers, valid
+  // while the directory holds their items; every change to the directory
+  // moves its change count, and then a candidate is offered only if it is
+  // still an element of the group. That test compares addresses and never
+  // touches a candidate that may have died.
+  Candidates candidates;
+  for (auto it = range.first; it != range.second; ++it) candidates.push_back(it->get());
   const std::int64_t startCount = changeCount.load(std::memory_order_relaxed);
-
-  // A candidate that left this directory during the walk is not offered.
-  // Only worth asking once the directory has changed at all.
   auto stillIndexed = [&](RK_Stuff* candidate) {
     if (changeCount.load(std::memory_order_relaxed) == startCount) return true;
-    return candidate->sortDir.lock().get() == this && !candidate->IsCheckedOutWriteable();
+    const auto now = stuffByGuid.equal_range(key.Get());
+    for (auto it = now.first; it != now.second; ++it)
+      if (it->get() == candidate) return true;
+    return false;
   };
 
   for (int pass = 0; pass < 2; ++pass) {
-    for (const boost::intrusive_ptr<RK_Stuff>& candidate : candidates) {
-      if (!stillIndexed(candidate.get())) continue;
+    for (RK_Stuff* candidate : candidates) {
+      if (!stillIndexed(candidate)) continue;
       const bool matches =
           pass == 0 ? candidate->IdenticalRequest(request) : candidate->CanSatisfyRequest(request);
       if (!matches) continue;
       if (wasOnDisk) *wasOnDisk = candidate->IsOnDisk();
       if (candidate->Checkout(flags) != RK_CheckoutResult_NotCheckedOut) {
-        *found = candidate.get();
+        *found = candidate;
         return RK_CheckoutResult_CheckedOut;
       }
     }

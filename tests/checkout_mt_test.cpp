@@ -49,8 +49,8 @@ TEST(CheckoutStressTest, ConcurrentHitPathEnteringAndReclaimingKeepTheInvariants
   rkhost::control::SetMemoryStat(0);
   RK_Birth(false);
   rkhost::control::ClearCaptured();
-  const boost::shared_ptr<RK_Bag> bag = RK_GlobalBag();
-  const boost::shared_ptr<RK_SortDir> dir = RK_GlobalSortDir();
+  boost::shared_ptr<RK_Bag> bag = RK_GlobalBag();
+  boost::shared_ptr<RK_SortDir> dir = RK_GlobalSortDir();
 
   std::vector<plinth::utility::Guid> guids;
   for (int i = 0; i < kGuids; ++i) guids.push_back(plinth::utility::Guid(0x1000 + i, 0x2000 + i));
@@ -145,6 +145,9 @@ TEST(CheckoutStressTest, ConcurrentHitPathEnteringAndReclaimingKeepTheInvariants
   // Every item still alive is held by the directory alone.
   EXPECT_EQ(g_alive.load(), static_cast<int>(order.size()));
 
+  // With the module's last references gone, so are all items.
+  bag.reset();
+  dir.reset();
   RK_StopAllAsyncWork();
   RK_Death();
   EXPECT_EQ(g_alive.load(), 0);
