@@ -93,6 +93,8 @@ TEST_F(BagTest, WalksOldestFirstAndKeepsInsertionOrderForEqualStamps) {
   EXPECT_EQ(young->GetBag(), bag);
   EXPECT_GT(young->GetLastUseTime(), t1);
   EXPECT_TRUE(VerificationNumbers().empty());
+  // The bag holds plain pointers: it goes before the items do.
+  bag.reset();
 }
 
 TEST_F(BagTest, RefusesAnItemThatIsInABagAlreadyAndChangesNothing) {
@@ -127,6 +129,7 @@ TEST_F(BagTest, RefusesAnItemThatIsInABagAlreadyAndChangesNothing) {
   // And it can still be removed from where it is.
   bag1->RemoveStuff(a.get());
   EXPECT_EQ(Order(bag1), std::vector<RK_Stuff*>{b.get()});
+  bag1.reset();
 }
 
 TEST_F(BagTest, RemovalFromTheWrongBagIsRefused) {
@@ -207,6 +210,7 @@ TEST_F(BagTest, CopyAssignmentCopiesElementsAndSettingsWithoutTellingItems) {
   EXPECT_EQ(Order(original), std::vector<RK_Stuff*>{b.get()});
   original->EnableDiskCache(false);
   EXPECT_FALSE(original->IsDiskCacheEnabled());
+  original.reset();
 }
 
 TEST_F(BagTest, DestroyingABagReleasesItsItemsQuietly) {
