@@ -191,7 +191,8 @@ TEST_F(ReceiptTest, CopiesShareOneCheckoutAndCheckItInOnce) {
     onB = onA;
     EXPECT_EQ(b->GetCheckoutCount(), 0u);
     EXPECT_EQ(a->GetCheckoutCount(), 1u);
-    onB = onB;  // self-assignment keeps the share
+    RK_ScCheckout& alias = onB;
+    onB = alias;  // self-assignment keeps the share
     EXPECT_TRUE(onB.DidCheckout());
     onA = RK_ScCheckout();
     EXPECT_EQ(a->GetCheckoutCount(), 1u);
