@@ -1,6 +1,7 @@
 // Profiler scopes: names, volumes and their once-created logs.
 #include "frame/profile.h"
 
+#include <atomic>
 #include <boost/thread/once.hpp>
 
 namespace {
@@ -18,17 +19,22 @@ constexpr ScopeDef kScopes[RKp_Profile_Count] = {
     {"VX.render.RK_Stuff::PrepAndWrite", 6}, {"VX.render.RK_SortDir::RemoveStuff", 6},
 };
 
-// A log is written once, inside its call_once, and only read afterwards; it
-// lives until the process ends.
+// A log is created once, inside its call_once, and lives until the process
+// ends. boost::call_once marks its flag done inside libboost_thread, which a
+// ThreadSanitizer build does not instrument, so the log is also published
+// through `log` (release here, acquire in RKp_ProfileLogFor): that pair is
+// the ordering every build can see.
 struct ScopeLog {
   boost::once_flag once = BOOST_ONCE_INIT;
-  boost::intrusive_ptr<plinth::debug::ProfileDataLog> log;
+  boost::intrusive_ptr<plinth::debug::ProfileDataLog> owner;
+  std::atomic<plinth::debug::ProfileDataLog*> log{nullptr};
 };
 ScopeLog S_logs[RKp_Profile_Count];
 
 void CreateLog(RKp_ProfileScopeId id) {
-  S_logs[id].log =
+  S_logs[id].owner =
       plinth::debug::CodeProfilerManager::Get().CreateNewProfileDataLog(kScopes[id].name, kScopes[id].volume);
+  S_logs[id].log.store(S_logs[id].owner.get(), std::memory_order_release);
 }
 
 }  // namespace
@@ -37,5 +43,5 @@ boost::intrusive_ptr<plinth::debug::ProfileDataLog> RKp_ProfileLogFor(RKp_Profil
   plinth::debug::CodeProfilerManager& manager = plinth::debug::CodeProfilerManager::Get();
   if (!manager.IsConditionalProfiling() || manager.GetProfilingVolume() < kScopes[id].volume) return {};
   boost::call_once(S_logs[id].once, [id] { CreateLog(id); });
-  return S_logs[id].log;
+  return boost::intrusive_ptr<plinth::debug::ProfileDataLog>(S_logs[id].log.load(std::memory_order_acquire));
 }

@@ -5,6 +5,7 @@
 // call the accessors on its own thread.
 #include "rkcache/readahead.h"
 
+#include <atomic>
 #include <boost/thread/lock_types.hpp>
 #include <cstring>
 
@@ -16,6 +17,14 @@ static_assert(sizeof(T_Time) == sizeof(std::int64_t), "T_Time is copied as one 8
 boost::shared_ptr<ReadAheadInfo> ReadAheadInfo::mInstance;
 boost::once_flag ReadAheadInfo::mOnceFlag = BOOST_ONCE_INIT;
 
+namespace {
+// Set once mInstance is written. boost::call_once marks its flag done inside
+// libboost_thread, which a ThreadSanitizer build does not instrument; this
+// release/acquire pair orders the write of mInstance before every read in a
+// way every build can see.
+std::atomic<bool> S_instancePublished{false};
+}  // namespace
+
 ReadAheadInfo::ReadAheadInfo() = default;
 
 ReadAheadInfo::~ReadAheadInfo() = default;
@@ -25,10 +34,12 @@ void ReadAheadInfo::CreateInstance() {
   // destruction, whatever happens to mInstance.
   static const boost::shared_ptr<ReadAheadInfo> instance(new ReadAheadInfo());
   mInstance = instance;
+  S_instancePublished.store(true, std::memory_order_release);
 }
 
 boost::shared_ptr<ReadAheadInfo> ReadAheadInfo::Get() {
   boost::call_once(mOnceFlag, &ReadAheadInfo::CreateInstance);
+  S_instancePublished.load(std::memory_order_acquire);
   return mInstance;
 }
 
