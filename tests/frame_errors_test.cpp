@@ -67,16 +67,6 @@ int ThrownCode(F&& f) {
 
 }  // namespace
 
-TEST(FrameErrors, CodesAndGroup) {
-  EXPECT_EQ(RK_ModuleErrorCheckout, 0x3A03);
-  EXPECT_EQ(RK_ModuleErrorNotCheckedOut, 0x3A04);
-  EXPECT_EQ(RK_ModuleErrorDiskCacheFolder, 0x3A07);
-  EXPECT_EQ(RK_InternalErrorCode, 3);
-  EXPECT_EQ(RK_ErrorGroup, 0x3A0000);
-  // The thrown codes carry the group number in their upper byte.
-  EXPECT_EQ(RK_ModuleErrorCheckout >> 8, RK_ErrorGroup >> 16);
-}
-
 TEST(FrameErrors, MessageTableHoldsTheStoredTextsAndTheTerminator) {
   ASSERT_NE(RK_G_zref, nullptr);
   EXPECT_STREQ(RK_G_zref->moduleKey, "RK");

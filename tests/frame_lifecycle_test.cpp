@@ -191,17 +191,3 @@ TEST(FrameLifecycle, NestedGuardsCountOnTheGlobalBag) {
   bag.reset();
   RK_Death();
 }
-
-TEST(FrameLifecycle, ClockIsUniversalTimeWithMicroseconds) {
-  const boost::posix_time::ptime before = boost::posix_time::microsec_clock::universal_time();
-  const boost::posix_time::ptime now = RK_Now();
-  const boost::posix_time::ptime after = boost::posix_time::microsec_clock::universal_time();
-  EXPECT_LE(before, now);
-  EXPECT_LE(now, after);
-  // Not local time: the offset would put it outside the bracket above, and
-  // successive readings advance at microsecond resolution.
-  bool sawSubMillisecond = false;
-  for (int i = 0; i < 1000 && !sawSubMillisecond; ++i)
-    sawSubMillisecond = RK_Now().time_of_day().fractional_seconds() % 1000 != 0;
-  EXPECT_TRUE(sawSubMillisecond);
-}

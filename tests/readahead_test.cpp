@@ -116,14 +116,6 @@ TEST_F(ReadAhead, SwitchingOffCallsEachCallbackOnceInKeyOrder) {
   EXPECT_EQ(calls_, (std::vector<int>{0, 1, 2, 3, 40}));
 }
 
-TEST_F(ReadAhead, SwitchingOffWithoutCallbacksOnlyClearsTheFlag) {
-  info_->SetDoReadAhead(true);
-  info_->SetReadAheadSkipInterval(7);
-  info_->SetDoReadAhead(false);
-  EXPECT_FALSE(OnRenderThread([&] { return info_->DoReadAhead(); }));
-  EXPECT_EQ(info_->GetReadAheadSkipInterval(), 1);
-}
-
 TEST_F(ReadAhead, ACallbackErrorEndsTheWalkAndReachesTheCaller) {
   info_->RegisterCancelOutstandingRequestsCallback(Key(0), [this] { calls_.push_back(0); });
   info_->RegisterCancelOutstandingRequestsCallback(Key(1), [this] {
