@@ -8,11 +8,11 @@
 #include "rkcache/export.h"
 
 enum : int {
-  RK_ModuleErrorCheckout = 0x3A03,        // check-out conflict
-  RK_ModuleErrorNotCheckedOut = 0x3A04,   // an operation that needs a check-out found none
-  RK_ModuleErrorDiskCacheFolder = 0x3A07, // the disk cache folder cannot be used
-  RK_InternalErrorCode = 3,               // thrown after a failed internal verification
-  RK_ErrorWrongAppVersion = 9,            // a cache file of another application version
+  RK_ModuleErrorCheckout = 0x3A03,         // check-out conflict
+  RK_ModuleErrorNotCheckedOut = 0x3A04,    // an operation that needs a check-out found none
+  RK_ModuleErrorDiskCacheFolder = 0x3A07,  // the disk cache folder cannot be used
+  RK_InternalErrorCode = 3,                // thrown after a failed internal verification
+  RK_ErrorWrongAppVersion = 9,             // a cache file of another application version
 };
 
 // The group passed with every user-visible report.

@@ -7,8 +7,8 @@
 
 #include <boost/date_time/posix_time/ptime.hpp>
 #include <boost/shared_ptr.hpp>
-#include <boost/thread/recursive_mutex.hpp>
 #include <boost/thread/lock_types.hpp>
+#include <boost/thread/recursive_mutex.hpp>
 
 #include "rkcache/types.h"
 
