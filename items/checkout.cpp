@@ -76,7 +76,6 @@ RK_CheckoutResult RK_Stuff::Checkout(int flags) {
     // so the item stays where lookups find it.
     if (ok && writeable) TempRemoveFromSortDir();
   } catch (...) {
-    ok = false;
     checkoutCount.store(checkoutCount.load(std::memory_order_relaxed) - 1, std::memory_order_release);
     intrusive_ptr_release(this);
     throw;
