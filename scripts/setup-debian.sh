@@ -4,7 +4,7 @@
 set -euo pipefail
 
 packages=(
-  build-essential cmake ninja-build clang pkg-config
+  build-essential cmake ninja-build clang libclang-rt-14-dev pkg-config
   libboost-dev libboost-thread-dev libboost-system-dev libboost-date-time-dev libboost-locale-dev
   libgtest-dev libgmock-dev libbenchmark-dev
 )
