@@ -4,6 +4,7 @@
 #include <gtest/gtest.h>
 
 #include <atomic>
+#include <chrono>
 #include <set>
 #include <string>
 #include <thread>
@@ -53,13 +54,19 @@ TEST(BagConcurrencyTest, EnteringAndFreeingConcurrentlyKeepsBagDirectoryAndStati
     });
   }
   threads.emplace_back([&] {
-    while (!writersDone.load()) bag->FreeUpSomeMemory(20 * kSize);
+    // The walkers pause between rounds: the lock is not fair, and walks
+    // back to back could keep the writers out for a long time.
+    while (!writersDone.load()) {
+      bag->FreeUpSomeMemory(20 * kSize);
+      std::this_thread::sleep_for(std::chrono::microseconds(50));
+    }
   });
   threads.emplace_back([&] {
     while (!writersDone.load()) {
       std::uint64_t memory = 0, disk = 0;
       bag->GetCacheSizesInBytes(memory, disk);
       if (queries.fetch_add(1) % 50 == 0) bag->PurgeAllMemoryCaches();
+      std::this_thread::sleep_for(std::chrono::microseconds(50));
     }
   });
   for (int w = 0; w < kWriters; ++w) threads[w].join();
