@@ -15,6 +15,7 @@
 
 #include <boost/date_time/posix_time/posix_time_types.hpp>
 #include <boost/make_shared.hpp>
+#include <boost/thread/lock_guard.hpp>
 #include <chrono>
 
 #include "diskcache/pacing.h"
@@ -26,6 +27,7 @@ boost::recursive_mutex RK_G_cacheLock;
 boost::recursive_mutex RK_G_writeControlLock;
 std::atomic<int> RK_G_writesSuspended{0};
 std::atomic<bool> RK_G_birthFlag{false};
+RKp_LockedGlobals RK_G_locked;
 
 namespace {
 
@@ -37,6 +39,14 @@ boost::shared_ptr<plinth::threads::QueueOnlyOnce> RK_G_resumeWritesQueue;
 // pool, rather than the pool itself, so that RK_StopAllAsyncWork can cancel
 // a pending resume check and wait for one that is running.
 boost::shared_ptr<plinth::threads::AsyncThreadedExecutor> RK_G_resumeExecutor;
+
+void PublishUnderLock(const boost::shared_ptr<RK_Bag>& bag, RK_SortDir* sortDir) {
+  boost::lock_guard<boost::recursive_mutex> lock(RK_G_cacheLock);
+  RK_G_locked.bag = bag.get();
+  RK_G_locked.bagLink = bag;
+  RK_G_locked.sortDir = sortDir;
+  ++RK_G_locked.epoch;
+}
 
 // Cancel drops what has not started; resume lets a suspended executor
 // finish what it runs; then wait until nothing of ours runs.
@@ -67,8 +77,11 @@ void RK_Birth(bool scanWhileInBackground) {
 
   // Plain new: both derive from HK_MemTrackedObject, so this is the tracked
   // allocation, and a throwing constructor frees through the tracked delete.
-  boost::atomic_store(&RK_G_bag, boost::shared_ptr<RK_Bag>(new RK_Bag()));
-  boost::atomic_store(&RK_G_sortDir, boost::shared_ptr<RK_SortDir>(new RK_SortDir()));
+  boost::shared_ptr<RK_Bag> bag(new RK_Bag());
+  boost::shared_ptr<RK_SortDir> sortDir(new RK_SortDir());
+  boost::atomic_store(&RK_G_bag, bag);
+  boost::atomic_store(&RK_G_sortDir, sortDir);
+  PublishUnderLock(bag, sortDir.get());
 }
 
 void RK_StopAllAsyncWork() {
@@ -84,6 +97,7 @@ void RK_Death() {
   JOT_Log(10, "RK", "Death", "RK Death");
   boost::shared_ptr<RK_Bag> bag = boost::atomic_load(&RK_G_bag);
   boost::shared_ptr<RK_SortDir> sortDir = boost::atomic_load(&RK_G_sortDir);
+  PublishUnderLock(boost::shared_ptr<RK_Bag>(), nullptr);
   boost::atomic_store(&RK_G_bag, boost::shared_ptr<RK_Bag>());
   boost::atomic_store(&RK_G_sortDir, boost::shared_ptr<RK_SortDir>());
   // The directory goes first: it holds the references that keep the bag's
@@ -91,6 +105,15 @@ void RK_Death() {
   sortDir.reset();
   bag.reset();
   RK_Stuff::Death();
+}
+
+RK_Bag* RKp_BagUnderLock(const boost::weak_ptr<RK_Bag>& link, boost::shared_ptr<RK_Bag>& keep) {
+  // The global bag is alive while it is published: RK_Death unpublishes it
+  // under the lock before dropping its reference.
+  if (RK_G_locked.bag && !link.owner_before(RK_G_locked.bagLink) && !RK_G_locked.bagLink.owner_before(link))
+    return RK_G_locked.bag;
+  keep = link.lock();
+  return keep.get();
 }
 
 boost::shared_ptr<RK_Bag> RK_GlobalBag() {
@@ -120,13 +143,16 @@ boost::posix_time::ptime RK_Now() {
                      std::chrono::duration_cast<std::chrono::microseconds>(sinceEpoch).count());
 }
 
-// The bag is fetched after the lock is taken: its lock-hold count is guarded
-// by that lock. Members are destroyed in reverse, so the count is lowered and
-// the bag reference dropped before the lock is released.
-RK_ScCacheLock::RK_ScCacheLock() : lock_(RK_G_cacheLock), bag_(RK_GlobalBag()) {
+// The bag is read after the lock is taken: it and its lock-hold count are
+// guarded by that lock, and the lock is released only after the destructor
+// body lowered the count again. Should RK_Death or RK_Birth have replaced
+// the bag meanwhile (on this thread, inside the guard), the old bag may be
+// gone and is not touched.
+RK_ScCacheLock::RK_ScCacheLock()
+    : lock_(RK_G_cacheLock), bag_(RK_G_locked.bag), bagEpoch_(RK_G_locked.epoch) {
   if (bag_) ++bag_->lockHoldCount;
 }
 
 RK_ScCacheLock::~RK_ScCacheLock() {
-  if (bag_) --bag_->lockHoldCount;
+  if (bag_ && bagEpoch_ == RK_G_locked.epoch) --bag_->lockHoldCount;
 }

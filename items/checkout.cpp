@@ -164,17 +164,11 @@ void RK_Stuff::Checkin(int flags, const boost::posix_time::time_duration& cost) 
     checkoutCount.store(count - 1, std::memory_order_release);
 
     if (restamp && !clockError) {
-      if (boost::shared_ptr<RK_Bag> owner = bag.lock()) {
-        // The bag's remove-and-add, done on its set directly: the item's
-        // own link names the bag, so the bag's membership checks cannot
-        // fail here, and the link itself stays as it is. The ordering key
-        // changes only while the element is out of the set; the extracted
-        // node goes back in, so nothing is allocated, and the hint at the
-        // young end makes the insertion amortised constant time.
-        RK_StuffByLastUse& order = owner->stuffByLastUse;
-        RK_StuffByLastUse::node_type node = order.extract(bagPosition);
-        lastUseTime = now;
-        bagPosition = order.insert(order.end(), std::move(node));
+      boost::shared_ptr<RK_Bag> keep;
+      if (RK_Bag* owner = RKp_BagUnderLock(bag, keep)) {
+        // The item's own link names the bag, so the membership checks of a
+        // remove-and-add could not fail; the bag moves it directly.
+        owner->MarkUsed(this, now);
       } else {
         lastUseTime = now;
       }

@@ -5,12 +5,22 @@
 // holding receipt share one Holding record; the receipt that brings its
 // holder count to zero is the one that checks in, unless a copy released
 // the check-out to its caller.
+//
+// References: a check-out holds one reference to its item (RK_Stuff::Checkout
+// takes it, RK_Stuff::Checkin drops it). The receipts that share a check-out
+// hold one reference fewer of their own than there are of them: one of their
+// `stuff` pointers stands for the check-out's reference, so the hit path
+// takes no second one. The pointers are interchangeable, so whichever
+// receipt checks in hands its pointer to the check-in, and the others drop
+// theirs. Release gives the check-out's reference to the caller and takes
+// one for the receipts in its place.
 #include "rkcache/receipt.h"
 
 #include <atomic>
 #include <boost/make_shared.hpp>
 #include <utility>
 
+#include "frame/globals.h"
 #include "frame/report.h"
 #include "rkcache/lifecycle.h"
 #include "rkcache/sortdir.h"
@@ -84,7 +94,8 @@ void RK_ScCheckout::LetGo(int flags, const boost::posix_time::time_duration& cos
     const bool last = shared->holders.fetch_sub(1, std::memory_order_acq_rel) == 1;
     if (!last || shared->released.load(std::memory_order_acquire)) return;
   }
-  item->Checkin(flags, cost);
+  // The pointer stands for the check-out's reference, which the check-in drops.
+  item.detach()->Checkin(flags, cost);
 }
 
 RK_CheckoutResult RK_ScCheckout::Checkout(RK_Stuff* item, int flags) {
@@ -93,7 +104,7 @@ RK_CheckoutResult RK_ScCheckout::Checkout(RK_Stuff* item, int flags) {
   wasOnDisk = item->IsOnDisk();
   const RK_CheckoutResult r = item->Checkout(flags);
   if (r != RK_CheckoutResult_NotCheckedOut) {
-    stuff = item;
+    stuff.reset(item, false);  // adopts the check-out's reference
     result = r;
   }
   return r;
@@ -101,12 +112,15 @@ RK_CheckoutResult RK_ScCheckout::Checkout(RK_Stuff* item, int flags) {
 
 RK_CheckoutResult RK_ScCheckout::FindAndCheckout(RK_Stuff* request, int flags) {
   LetGo(0, boost::posix_time::time_duration());
-  const boost::shared_ptr<RK_SortDir> dir = RK_GlobalSortDir();
+  // The directory is used under the cache lock, which keeps the global one
+  // alive without a reference of our own; the lookup takes it again.
+  RK_ScCacheLock lock;
+  RK_SortDir* const dir = RK_G_locked.sortDir;
   if (!dir) return RK_CheckoutResult_NotCheckedOut;
   RK_Stuff* found = nullptr;
   const RK_CheckoutResult r = dir->FindAndCheckout(request, flags, &found, &wasOnDisk);
   if (r != RK_CheckoutResult_NotCheckedOut) {
-    stuff = found;
+    stuff.reset(found, false);  // adopts the check-out's reference
     result = r;
   }
   return r;
@@ -129,6 +143,9 @@ bool RK_ScCheckout::IsOnDisk() const {
 }
 
 RK_Stuff* RK_ScCheckout::Release() {
+  // The check-out's reference goes to the caller; the receipts keep one of
+  // their own in its place (before the flag tells the other copies).
+  if (Holds()) intrusive_ptr_add_ref(stuff.get());
   if (result != RK_CheckoutResult_NotCheckedOut && holding) {
     // The caller now owns the shared check-out: no copy may check it in.
     if (Holds()) holding->released.store(true, std::memory_order_release);

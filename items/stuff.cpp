@@ -13,8 +13,15 @@
 #include "frame/report.h"
 #include "rkcache/errors.h"
 #include "rkcache/lifecycle.h"
+#include "rkcache/sortdir.h"
 
-RK_Stuff::RK_Stuff() : guid(plinth::utility::Guid::CreateUnique()), lastUseTime(RK_Now()) {}
+RK_Stuff::RK_Stuff()
+    : guid(plinth::utility::Guid::CreateUnique()), guidHash(RK_GuidHash::Of(guid)), lastUseTime(RK_Now()) {}
+
+void RK_Stuff::SetGuid(const plinth::utility::Guid& g) {
+  guid = g;
+  guidHash = RK_GuidHash::Of(g);
+}
 
 // Only the last release gets here, and the bag and sort directory each hold
 // a reference while they index the item, so neither can still name it. The
@@ -48,10 +55,6 @@ void RK_Stuff::YourDiskCacheFileWasDeleted() const {}
 
 bool RK_Stuff::IsOnDisk() const {
   return static_cast<bool>(diskCacheFile);
-}
-
-bool RK_LastUseOrder::operator()(const RK_Stuff* a, const RK_Stuff* b) const {
-  return a->lastUseTime < b->lastUseTime;
 }
 
 // The checks read the count without the lock: they run on the thread that

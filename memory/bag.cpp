@@ -1,16 +1,18 @@
 // RK_Bag: every item the cache knows, ordered by last use (oldest first).
 //
 // An item is in at most one bag. While it is, its `bag` link names that bag
-// and its `bagPosition` is its element, so removal needs no search. The
-// ordering key (`lastUseTime`) is only ever written while the item is out of
-// every bag's set: AddStuff stamps it before inserting, check-in removes the
-// item, restamps it and puts it back.
+// and its `bagPosition` is its element, so removal needs no search.
 //
-// Insertion is hinted at the young end: an item stamped now belongs after
-// every element, and a hinted insert there costs amortised constant time;
-// equal stamps land after the existing ones, so they keep insertion order.
-// The node freed by the last removal is kept for the next insertion, so
-// check-in's remove-then-add restamp allocates nothing.
+// The items form a list sorted by `lastUseTime`; equal stamps keep the order
+// in which the items came in. Whoever stamps an item as used now (AddStuff,
+// check-in) stamps it no earlier than the newest item in the bag: the clock
+// is read before the lock, so a thread that read it a moment earlier may
+// arrive second, and a wall clock set back would otherwise file fresh uses
+// as the oldest, to be evicted first. The stamp thus always belongs at the
+// young end: entering is an append and a use is a splice there, constant
+// time with no allocation and no rebalancing, which keeps the hit path
+// short. AddStuffGuts still places an item with any stamp correctly, by
+// stepping back from the young end past the items stamped later.
 #include "rkcache/bag.h"
 
 #include <exception>
@@ -65,21 +67,28 @@ void RK_Bag::AddStuff(boost::intrusive_ptr<RK_Stuff> stuff) {
   const boost::posix_time::ptime now = RK_Now();
   RK_ScCacheLock lock;
   if (stuff->bag.lock()) RKp_FailVerification(380, "stuff already in a bag");
-  stuff->lastUseTime = now;
+  stuff->lastUseTime = StampFor(now);
   AddStuffGuts(std::move(stuff));
 }
 
 void RK_Bag::AddStuffGuts(boost::intrusive_ptr<RK_Stuff> stuff) {
   if (stuff->bag.lock()) RKp_FailVerification(380, "stuff already in a bag");
-  RK_StuffByLastUse::iterator position;
-  if (!spareNode.empty()) {
-    spareNode.value() = stuff.get();
-    position = stuffByLastUse.insert(stuffByLastUse.end(), std::move(spareNode));
-  } else {
-    position = stuffByLastUse.insert(stuffByLastUse.end(), stuff.get());
-  }
-  stuff->bagPosition = position;
+  auto position = stuffByLastUse.end();
+  while (position != stuffByLastUse.begin() && (*std::prev(position))->lastUseTime > stuff->lastUseTime)
+    --position;
+  stuff->bagPosition = stuffByLastUse.insert(position, stuff.get());
   stuff->bag = weak_from_this();
+}
+
+boost::posix_time::ptime RK_Bag::StampFor(const boost::posix_time::ptime& now) const {
+  if (!stuffByLastUse.empty() && stuffByLastUse.back()->lastUseTime > now) return stuffByLastUse.back()->lastUseTime;
+  return now;
+}
+
+void RK_Bag::MarkUsed(RK_Stuff* stuff, const boost::posix_time::ptime& now) {
+  // Read before the move: the item itself may be the newest.
+  stuff->lastUseTime = StampFor(now);
+  stuffByLastUse.splice(stuffByLastUse.end(), stuffByLastUse, stuff->bagPosition);
 }
 
 void RK_Bag::RemoveStuff(RK_Stuff* stuff) {
@@ -90,7 +99,7 @@ void RK_Bag::RemoveStuff(RK_Stuff* stuff) {
 void RK_Bag::RemoveStuffGuts(RK_Stuff* stuff) {
   if (stuff->bag.lock().get() != this) RKp_FailVerification(402, "stuff not in the right bag");
   stuff->bag.reset();
-  spareNode = stuffByLastUse.extract(stuff->bagPosition);
+  stuffByLastUse.erase(stuff->bagPosition);
 }
 
 void RK_Bag::ClearBagAndSortDir() {

@@ -22,14 +22,9 @@
 #include "rkcache/errors.h"
 #include "rkcache/lifecycle.h"
 
-std::size_t RK_GuidHash::operator()(const boost::intrusive_ptr<RK_Stuff>& stuff) const {
-  const std::array<unsigned char, 16> bytes = stuff->GetGuid().GuidToBytes();
+std::size_t RK_GuidHash::Of(const plinth::utility::Guid& guid) {
+  const std::array<unsigned char, 16> bytes = guid.GuidToBytes();
   return boost::hash_range(bytes.begin(), bytes.end());
-}
-
-bool RK_GuidEqual::operator()(const boost::intrusive_ptr<RK_Stuff>& a,
-                              const boost::intrusive_ptr<RK_Stuff>& b) const {
-  return a->GetGuid() == b->GetGuid();
 }
 
 namespace {

@@ -97,6 +97,31 @@ TEST_F(BagTest, WalksOldestFirstAndKeepsInsertionOrderForEqualStamps) {
   bag.reset();
 }
 
+TEST_F(BagTest, UsesAfterTheClockWasSetBackStillCountAsTheNewest) {
+  auto bag = NewBag();
+  auto old = TestStuff::Make();
+  bag->AddStuff(old);
+  // An item last used an hour "from now": as if the clock had since been set back.
+  auto future = TestStuff::Make();
+  const ptime later = RK_Now() + boost::posix_time::hours(1);
+  RK_TEST_Access::SetLastUseTime(*future, later);
+  {
+    RK_ScCacheLock lock;
+    RK_TEST_Access::AddStuffGuts(*bag, future);
+  }
+  auto fresh = TestStuff::Make();
+  bag->AddStuff(fresh);
+  EXPECT_EQ(Order(bag), (std::vector<RK_Stuff*>{old.get(), future.get(), fresh.get()}));
+  EXPECT_EQ(fresh->GetLastUseTime(), later);
+
+  // A check-in is a use too: the item goes behind both, not to the front.
+  ASSERT_EQ(old->Checkout(RK_Checkout_ReadOnly), RK_CheckoutResult_CheckedOut);
+  old->Checkin(0, boost::posix_time::time_duration());
+  EXPECT_EQ(Order(bag), (std::vector<RK_Stuff*>{future.get(), fresh.get(), old.get()}));
+  EXPECT_EQ(old->GetLastUseTime(), later);
+  bag.reset();
+}
+
 TEST_F(BagTest, RefusesAnItemThatIsInABagAlreadyAndChangesNothing) {
   auto bag1 = NewBag();
   auto bag2 = NewBag();

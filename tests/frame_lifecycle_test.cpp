@@ -166,6 +166,25 @@ TEST(FrameLifecycle, StopDropsQueuedAndDelayedTasksEvenWhileSuspended) {
   EXPECT_EQ(ran->load(), 0);
 }
 
+TEST(FrameLifecycle, AGuardHeldAcrossDeathAndRebirthLeavesBothBagsAlone) {
+  RK_Birth(false);
+  RK_StopAllAsyncWork();
+  {
+    RK_ScCacheLock guard;
+    RK_Death();  // destroys the bag the guard raised
+    RK_Birth(false);
+    boost::shared_ptr<RK_Bag> fresh = RK_GlobalBag();
+    EXPECT_EQ(RK_TEST_Access::LockHoldCount(*fresh), 0u);
+    {
+      RK_ScCacheLock inner;
+      EXPECT_EQ(RK_TEST_Access::LockHoldCount(*fresh), 1u);
+    }
+  }  // the outer guard touches neither the dead bag nor the new one
+  EXPECT_EQ(RK_TEST_Access::LockHoldCount(*RK_GlobalBag()), 0u);
+  RK_StopAllAsyncWork();
+  RK_Death();
+}
+
 TEST(FrameLifecycle, NestedGuardsCountOnTheGlobalBag) {
   RK_Birth(false);
   boost::shared_ptr<RK_Bag> bag = RK_GlobalBag();

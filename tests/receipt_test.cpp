@@ -157,6 +157,8 @@ TEST_F(ReceiptTest, CopiesShareOneCheckoutAndCheckItInOnce) {
   TestStuffPtr b = Enter(TestStuff::Make());
   {
     RK_ScCheckout original(a.get(), kReadOnly);
+    // Test, directory and the check-out: a lone holder takes no reference of its own.
+    EXPECT_EQ(a->RefCountForDiagnostics(), 3u);
     {
       RK_ScCheckout copy(original);
       RK_ScCheckout another = copy;
@@ -164,11 +166,14 @@ TEST_F(ReceiptTest, CopiesShareOneCheckoutAndCheckItInOnce) {
       EXPECT_TRUE(another.DidCheckout());
       EXPECT_EQ(copy.GetStuff(), a.get());
       EXPECT_EQ(a->GetCheckoutCount(), 1u);
+      EXPECT_EQ(a->RefCountForDiagnostics(), 5u);  // each copy keeps the item alive
     }
     EXPECT_EQ(a->GetCheckoutCount(), 1u);  // the original still holds it
+    EXPECT_EQ(a->RefCountForDiagnostics(), 3u);
     EXPECT_TRUE(original.DidCheckout());
   }
   EXPECT_EQ(a->GetCheckoutCount(), 0u);
+  EXPECT_EQ(a->RefCountForDiagnostics(), 2u);
 
   // Check-in through one copy only lets go of its share; the last one to
   // let go checks in, with its own flags.
@@ -208,9 +213,13 @@ TEST_F(ReceiptTest, CopiesShareOneCheckoutAndCheckItInOnce) {
     EXPECT_FALSE(copy.DidCheckout());
     EXPECT_FALSE(original.DidCheckout());
     EXPECT_FALSE(RK_ScCheckout(original).DidCheckout());
+    // Test, directory, the released check-out and both receipts.
+    EXPECT_EQ(a->RefCountForDiagnostics(), 5u);
   }
   EXPECT_EQ(a->GetCheckoutCount(), 1u);
+  EXPECT_EQ(a->RefCountForDiagnostics(), 3u);
   released->Checkin(0, time_duration());
+  EXPECT_EQ(a->RefCountForDiagnostics(), 2u);
 
   // Copies on two threads let go at the same time: exactly one check-in.
   for (int round = 0; round < 50; ++round) {

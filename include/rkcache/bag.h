@@ -72,14 +72,18 @@ class RK_EXPORT RK_Bag : public HK_MemTrackedObject, public boost::enable_shared
   friend class RK_TEST_Access;
 
   // The same as AddStuff / RemoveStuff without taking the lock and (for
-  // AddStuffGuts) without stamping. REQUIRES: the cache lock is held.
+  // AddStuffGuts) without stamping: the item goes behind every item stamped
+  // no later than it. REQUIRES: the cache lock is held.
   void AddStuffGuts(boost::intrusive_ptr<RK_Stuff> stuff);
   void RemoveStuffGuts(RK_Stuff* stuff);
+  // Stamps an item of this bag as used at `now` and moves it to the young
+  // end. REQUIRES: the cache lock is held; the item is in this bag.
+  void MarkUsed(RK_Stuff* stuff, const boost::posix_time::ptime& now);
+  // `now`, or the newest stamp in the bag if that is later (see bag.cpp).
+  // REQUIRES: the cache lock is held.
+  boost::posix_time::ptime StampFor(const boost::posix_time::ptime& now) const;
 
   RK_StuffByLastUse stuffByLastUse;  // cache lock
-  // The node of the last removed element, reused by the next insertion so
-  // that check-in's remove-and-restamp does not allocate. Cache lock.
-  RK_StuffByLastUse::node_type spareNode;
   std::uint32_t lockHoldCount = 0;            // cache lock (raised by RK_ScCacheLock)
   std::atomic<bool> diskCacheEnabled{false};  // atomic: read without the lock
   plinth::filesupport::Dir diskCacheDir;      // written by the configuring thread

@@ -9,6 +9,7 @@
 #include <boost/shared_ptr.hpp>
 #include <boost/thread/lock_types.hpp>
 #include <boost/thread/recursive_mutex.hpp>
+#include <cstdint>
 
 #include "rkcache/types.h"
 
@@ -44,5 +45,6 @@ class RK_EXPORT RK_ScCacheLock {
 
  private:
   boost::unique_lock<boost::recursive_mutex> lock_;
-  boost::shared_ptr<RK_Bag> bag_;
+  RK_Bag* bag_;              // the global bag when the lock was taken
+  std::uint64_t bagEpoch_;   // and which one it was (see RK_Death)
 };

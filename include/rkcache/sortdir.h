@@ -18,11 +18,17 @@
 #include "host/hk.h"
 #include "rkcache/stuff.h"
 
+// An item's hash is boost::hash_range over the 16 bytes of its GUID
+// (Guid::GuidToBytes). It is computed whenever the GUID is set and kept with
+// it, so lookups do not recompute it.
 struct RK_EXPORT RK_GuidHash {
-  std::size_t operator()(const boost::intrusive_ptr<RK_Stuff>& stuff) const;
+  static std::size_t Of(const plinth::utility::Guid& guid);
+  std::size_t operator()(const boost::intrusive_ptr<RK_Stuff>& stuff) const { return stuff->guidHash; }
 };
-struct RK_EXPORT RK_GuidEqual {
-  bool operator()(const boost::intrusive_ptr<RK_Stuff>& a, const boost::intrusive_ptr<RK_Stuff>& b) const;
+struct RK_GuidEqual {
+  bool operator()(const boost::intrusive_ptr<RK_Stuff>& a, const boost::intrusive_ptr<RK_Stuff>& b) const {
+    return a->GetGuid() == b->GetGuid();
+  }
 };
 using RK_StuffByGuid = boost::unordered_multiset<boost::intrusive_ptr<RK_Stuff>, RK_GuidHash, RK_GuidEqual>;
 

@@ -21,8 +21,8 @@
 #include <boost/shared_ptr.hpp>
 #include <boost/weak_ptr.hpp>
 #include <cstdint>
+#include <list>
 #include <map>
-#include <set>
 
 #include "plinth/files.h"
 #include "plinth/guid.h"
@@ -30,11 +30,10 @@
 #include "plinth/streams.h"
 #include "rkcache/types.h"
 
-// Orders the bag's items by last use, oldest first.
-struct RK_EXPORT RK_LastUseOrder {
-  bool operator()(const RK_Stuff* a, const RK_Stuff* b) const;
-};
-using RK_StuffByLastUse = std::multiset<RK_Stuff*, RK_LastUseOrder>;
+// A bag's items, sorted by last use, oldest first; items with equal stamps
+// stand in the order in which they were added. A list, so that moving a used
+// item to the young end is a splice.
+using RK_StuffByLastUse = std::list<RK_Stuff*>;
 
 // The factory registry: match name (UTF-16, exact, case-sensitive) to factory.
 using RK_FactoryMap = std::map<plinth::utility::SmallUString, RK_Factory>;
@@ -62,7 +61,8 @@ class RK_EXPORT RK_Stuff : public plinth::utility::RefCountedObject {
 
   // ---- Accessors (no lock; hold RK_ScCacheLock for a consistent view). ----
   plinth::utility::Guid GetGuid() const { return guid; }
-  void SetGuid(const plinth::utility::Guid& g) { guid = g; }
+  // Not while the item is in a sort directory: the GUID is its key there.
+  void SetGuid(const plinth::utility::Guid& g);
   std::uint32_t GetCheckoutCount() const { return checkoutCount.load(std::memory_order_acquire); }
   bool IsCheckedOutWriteable() const { return checkedOutWriteable.load(std::memory_order_acquire); }
   boost::posix_time::ptime GetLastUseTime() const { return lastUseTime; }
@@ -112,7 +112,7 @@ class RK_EXPORT RK_Stuff : public plinth::utility::RefCountedObject {
   friend class RK_Bag;
   friend class RK_SortDir;
   friend class RK_ScCheckout;
-  friend struct RK_LastUseOrder;
+  friend struct RK_GuidHash;
   friend class RK_TEST_Access;  // test hook, defined by the test suites only
   // Binds the private write job (diskcache/background_write.h).
   friend bool RKp_QueueBackgroundWrite(const boost::intrusive_ptr<RK_Stuff>& stuff);
@@ -130,6 +130,7 @@ class RK_EXPORT RK_Stuff : public plinth::utility::RefCountedObject {
   RK_INTERNAL void WriteToDiskAsync(boost::intrusive_ptr<RK_Stuff> self);
 
   plinth::utility::Guid guid;                    // set before entering the cache
+  std::size_t guidHash;                          // RK_GuidHash's value for guid, kept with it
   std::atomic<std::uint32_t> checkoutCount{0};   // written under the cache lock
   std::atomic<bool> checkedOutWriteable{false};  // written under the cache lock or by the sole holder
   boost::posix_time::ptime lastUseTime;          // cache lock; never changed while in a bag's set
