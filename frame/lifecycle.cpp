@@ -79,9 +79,14 @@ void RK_Birth(bool scanWhileInBackground) {
   // allocation, and a throwing constructor frees through the tracked delete.
   boost::shared_ptr<RK_Bag> bag(new RK_Bag());
   boost::shared_ptr<RK_SortDir> sortDir(new RK_SortDir());
-  boost::atomic_store(&RK_G_bag, bag);
-  boost::atomic_store(&RK_G_sortDir, sortDir);
+  // A second birth replaces the objects of the first. They are kept alive
+  // until the new ones are published under the lock, so that no guard can
+  // meet a published bag that is already gone; then the directory goes
+  // before the bag, as in RK_Death.
+  boost::shared_ptr<RK_Bag> oldBag = boost::atomic_exchange(&RK_G_bag, bag);
+  boost::shared_ptr<RK_SortDir> oldSortDir = boost::atomic_exchange(&RK_G_sortDir, sortDir);
   PublishUnderLock(bag, sortDir.get());
+  oldSortDir.reset();
 }
 
 void RK_StopAllAsyncWork() {
