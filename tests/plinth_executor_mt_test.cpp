@@ -3,6 +3,7 @@
 // Snapshot and ExpediteDelayed, never by long sleeps.
 #include <gtest/gtest.h>
 
+#include <algorithm>
 #include <atomic>
 #include <boost/make_shared.hpp>
 #include <chrono>
@@ -21,6 +22,7 @@ namespace {
 
 using namespace plinth::threads;
 using Clock = std::chrono::steady_clock;
+using Delays = std::vector<std::uint32_t>;
 
 // Blocks tasks until the test opens it.
 class Gate {
@@ -51,11 +53,23 @@ bool PollUntil(const std::function<bool()>& done) {
   return true;
 }
 
+// The order in which tasks recorded themselves.
+struct Order {
+  std::mutex m;
+  std::vector<int> seen;
+  void Add(int i) {
+    std::lock_guard<std::mutex> lock(m);
+    seen.push_back(i);
+  }
+  std::vector<int> Get() {
+    std::lock_guard<std::mutex> lock(m);
+    return seen;
+  }
+};
+
 // Counts the tasks of one test that run at the same time.
 struct Concurrency {
-  std::atomic<int> now{0};
-  std::atomic<int> max{0};
-  std::atomic<int> ran{0};
+  std::atomic<int> now{0}, max{0}, ran{0};
   void Enter() {
     const int n = ++now;
     int m = max.load();
@@ -68,37 +82,61 @@ struct Concurrency {
   }
 };
 
-// An object bound into a task: counts its destruction and whether it ran.
+// An object bound into a task: counts its destruction.
 struct Tracked {
   explicit Tracked(std::atomic<int>& destroyed) : destroyed_(destroyed) {}
   ~Tracked() { ++destroyed_; }
   std::atomic<int>& destroyed_;
-  std::atomic<bool> ran{false};
 };
 
 boost::shared_ptr<AsyncThreadedExecutor> NewSub(int limit) {
   return CreateSubExecutor(CreateIOBoundExecutor(), limit);
 }
 
+// Submits a task that holds a slot until `gate` opens; returns once it runs.
+void Occupy(AsyncExecutor& ex, Gate& gate) {
+  auto started = boost::make_shared<std::atomic<bool>>(false);
+  ex.Submit(
+      [started, &gate] {
+        *started = true;
+        gate.Wait();
+      },
+      0);
+  ASSERT_TRUE(PollUntil([&] { return started->load(); }));
+}
+
+// How long after its submission a task with the given delay started.
+Clock::duration StartDelay(AsyncExecutor& ex, std::uint32_t delayMs) {
+  struct State {
+    std::atomic<bool> done{false};
+    Clock::time_point started;
+  };
+  auto s = boost::make_shared<State>();
+  const auto submitted = Clock::now();
+  ex.Submit(
+      [s] {
+        s->started = Clock::now();
+        s->done = true;
+      },
+      delayMs);
+  EXPECT_TRUE(PollUntil([&] { return s->done.load(); }));
+  return s->done ? s->started - submitted : Clock::duration::zero();
+}
+
 TEST(PlinthExecutor, SubExecutorKeepsItsLimitAndRunsInOrder) {
   auto ex = NewSub(2);
   Gate gate;
   Concurrency c;
-  std::mutex orderMutex;
-  std::vector<int> order;
-  for (int i = 0; i < 6; ++i) {
+  Order order;
+  for (int i = 0; i < 6; ++i)
     ex->Submit(
         [&, i] {
-          {
-            std::lock_guard<std::mutex> lock(orderMutex);
-            order.push_back(i);
-          }
+          order.Add(i);
           c.Enter();
           gate.Wait();
           c.Leave();
         },
         0);
-  }
   ASSERT_TRUE(PollUntil([&] { return c.now.load() == 2; }));
   ExecutorSnapshot s = ex->Snapshot();
   EXPECT_EQ(s.running, 2u);
@@ -111,32 +149,19 @@ TEST(PlinthExecutor, SubExecutorKeepsItsLimitAndRunsInOrder) {
   EXPECT_EQ(ex->Snapshot().running, 0u);
   // The two that started first were the first two submitted (the order of
   // the rest is covered with a limit of 1, where it is deterministic).
-  ASSERT_EQ(order.size(), 6u);
-  EXPECT_EQ(std::set<int>(order.begin(), order.begin() + 2), (std::set<int>{0, 1}));
-  EXPECT_EQ(std::set<int>(order.begin(), order.end()), (std::set<int>{0, 1, 2, 3, 4, 5}));
+  std::vector<int> seen = order.Get();
+  ASSERT_EQ(seen.size(), 6u);
+  EXPECT_EQ(std::set<int>(seen.begin(), seen.begin() + 2), (std::set<int>{0, 1}));
+  std::sort(seen.begin(), seen.end());
+  EXPECT_EQ(seen, (std::vector<int>{0, 1, 2, 3, 4, 5}));
 }
 
 TEST(PlinthExecutor, DelayedTasksStartNoEarlierThanAskedAndCanBeExpedited) {
   auto ex = NewSub(2);
-  std::atomic<bool> shortDone{false};
-  Clock::time_point started;
-  const auto submitted = Clock::now();
-  ex->Submit(
-      [&] {
-        started = Clock::now();
-        shortDone = true;
-      },
-      30);
   std::atomic<int> longRuns{0};
   ex->Submit([&] { ++longRuns; }, 60000);
-
-  ExecutorSnapshot s = ex->Snapshot();
-  EXPECT_EQ(s.delayedMs.size(), 2u);
-  EXPECT_EQ(std::set<std::uint32_t>(s.delayedMs.begin(), s.delayedMs.end()),
-            (std::set<std::uint32_t>{30, 60000}));
-  ASSERT_TRUE(PollUntil([&] { return shortDone.load(); }));
-  EXPECT_GE(started - submitted, std::chrono::milliseconds(30));
-  EXPECT_EQ(ex->Snapshot().delayedMs, std::vector<std::uint32_t>{60000});
+  EXPECT_GE(StartDelay(*ex, 30), std::chrono::milliseconds(30));
+  EXPECT_EQ(ex->Snapshot().delayedMs, Delays{60000});
   EXPECT_EQ(longRuns.load(), 0);
 
   EXPECT_EQ(ex->ExpediteDelayed(), 1u);
@@ -145,84 +170,46 @@ TEST(PlinthExecutor, DelayedTasksStartNoEarlierThanAskedAndCanBeExpedited) {
   EXPECT_TRUE(ex->Snapshot().delayedMs.empty());
   EXPECT_EQ(ex->ExpediteDelayed(), 0u);
 
-  // The I/O executor honours delays too.
+  // The I/O executor honours delays too, and is a new executor each call.
   auto io = CreateIOBoundExecutor();
-  EXPECT_NE(io, CreateIOBoundExecutor());  // a new executor each call
-  std::atomic<bool> ioDone{false};
-  Clock::time_point ioStarted;
-  const auto ioSubmitted = Clock::now();
-  io->Submit(
-      [&] {
-        ioStarted = Clock::now();
-        ioDone = true;
-      },
-      20);
-  ASSERT_TRUE(PollUntil([&] { return ioDone.load(); }));
-  EXPECT_GE(ioStarted - ioSubmitted, std::chrono::milliseconds(20));
+  EXPECT_NE(io, CreateIOBoundExecutor());
+  EXPECT_GE(StartDelay(*io, 20), std::chrono::milliseconds(20));
 }
 
 TEST(PlinthExecutor, SuspendLetsRunningTasksFinishAndHoldsTheRest) {
   auto ex = NewSub(1);
   Gate gate;
-  std::mutex m;
-  std::vector<int> order;
-  auto record = [&](int i) {
-    std::lock_guard<std::mutex> lock(m);
-    order.push_back(i);
-  };
-  std::atomic<bool> firstStarted{false};
-  ex->Submit(
-      [&] {
-        firstStarted = true;
-        gate.Wait();
-        record(0);
-      },
-      0);
-  ASSERT_TRUE(PollUntil([&] { return firstStarted.load(); }));
+  Order order;
+  Occupy(*ex, gate);
   ex->Suspend();
-  for (int i = 1; i <= 3; ++i) ex->Submit([&, i] { record(i); }, 0);
+  for (int i = 1; i <= 3; ++i) ex->Submit([&, i] { order.Add(i); }, 0);
   gate.Open();
   ex->WaitUntilIdle();  // queued tasks of a suspended executor do not count
   ExecutorSnapshot s = ex->Snapshot();
   EXPECT_TRUE(s.suspended);
   EXPECT_EQ(s.running, 0u);
   EXPECT_EQ(s.ready, 3u);
-  {
-    std::lock_guard<std::mutex> lock(m);
-    EXPECT_EQ(order, std::vector<int>{0});
-  }
+  EXPECT_TRUE(order.Get().empty());
   ex->Resume();
   ex->WaitUntilIdle();
-  std::lock_guard<std::mutex> lock(m);
-  EXPECT_EQ(order, (std::vector<int>{0, 1, 2, 3}));
+  EXPECT_EQ(order.Get(), (std::vector<int>{1, 2, 3}));
   EXPECT_FALSE(ex->Snapshot().suspended);
 }
 
 TEST(PlinthExecutor, CancelDropsQueuedAndDelayedTasksWithoutRunningThem) {
   auto ex = NewSub(1);
   Gate gate;
-  std::atomic<bool> blockerStarted{false};
-  ex->Submit(
-      [&] {
-        blockerStarted = true;
-        gate.Wait();
-      },
-      0);
-  ASSERT_TRUE(PollUntil([&] { return blockerStarted.load(); }));
-
+  Occupy(*ex, gate);
   std::atomic<int> destroyed{0};
-  std::vector<Tracked*> seen;
+  std::atomic<int> ran{0};
   auto submitTracked = [&](std::uint32_t delay) {
-    auto t = boost::make_shared<Tracked>(destroyed);
-    seen.push_back(t.get());
-    ex->Submit([t] { t->ran = true; }, delay);
+    ex->Submit([t = boost::make_shared<Tracked>(destroyed), &ran] { ++ran; }, delay);
   };
-  for (int i = 0; i < 3; ++i) submitTracked(0);
-  submitTracked(50);
-  submitTracked(60000);
+  for (std::uint32_t delay : {0, 0, 0, 50, 60000}) submitTracked(delay);
   ExecutorSnapshot s = ex->Snapshot();
   EXPECT_EQ(s.ready, 3u);
-  EXPECT_EQ(s.delayedMs.size(), 2u);
+  std::sort(s.delayedMs.begin(), s.delayedMs.end());
+  EXPECT_EQ(s.delayedMs, (Delays{50, 60000}));
   EXPECT_EQ(destroyed.load(), 0);
 
   ex->Cancel();
@@ -235,18 +222,14 @@ TEST(PlinthExecutor, CancelDropsQueuedAndDelayedTasksWithoutRunningThem) {
   EXPECT_TRUE(s.delayedMs.empty());
   EXPECT_EQ(s.running, 1u);
 
-  std::atomic<bool> lateRan{false};
-  {
-    auto late = boost::make_shared<Tracked>(destroyed);
-    ex->Submit([late, &lateRan] { lateRan = true; }, 0);
-    ex->Submit([late, &lateRan] { lateRan = true; }, 10);
-  }
-  EXPECT_EQ(destroyed.load(), 6);  // later submissions are dropped at once
+  submitTracked(0);
+  submitTracked(10);
+  EXPECT_EQ(destroyed.load(), 7);  // later submissions are dropped at once
   ex->Resume();                    // resuming a cancelled executor starts nothing
   gate.Open();
   ex->WaitUntilIdle();
   EXPECT_EQ(ex->Snapshot().running, 0u);
-  EXPECT_FALSE(lateRan.load());
+  EXPECT_EQ(ran.load(), 0);
   EXPECT_EQ(ex->ExpediteDelayed(), 0u);
 }
 
@@ -265,14 +248,12 @@ TEST(PlinthExecutor, TaskExceptionsAreTracedAndTheSlotIsFreed) {
   ex->WaitUntilIdle();
   EXPECT_EQ(after.load(), 1);
   auto io = CreateIOBoundExecutor();
-  std::atomic<bool> ioAfter{false};
   io->Submit([] { throw std::runtime_error("io task failed"); }, 0);
-  io->Submit([&] { ioAfter = true; }, 0);
+  io->Submit([&] { ++after; }, 0);
   ASSERT_TRUE(PollUntil([&] {
     std::lock_guard<std::mutex> lock(m);
-    return traced.find("io task failed") != std::string::npos;
+    return after.load() == 2 && traced.find("io task failed") != std::string::npos;
   }));
-  ASSERT_TRUE(PollUntil([&] { return ioAfter.load(); }));
   plinth::debug::SetTraceSink({});
   EXPECT_NE(traced.find("disk on fire"), std::string::npos) << traced;
   EXPECT_NE(traced.find("non-standard exception"), std::string::npos) << traced;
@@ -281,8 +262,7 @@ TEST(PlinthExecutor, TaskExceptionsAreTracedAndTheSlotIsFreed) {
 TEST(PlinthExecutor, ManySubmittersExactCountsWithinTheLimit) {
   auto ex = NewSub(3);
   Concurrency c;
-  constexpr int kThreads = 8;
-  constexpr int kEach = 300;
+  constexpr int kThreads = 8, kEach = 300;
   std::atomic<int> nested{0};
   std::vector<std::thread> threads;
   for (int t = 0; t < kThreads; ++t) {
@@ -303,24 +283,18 @@ TEST(PlinthExecutor, ManySubmittersExactCountsWithinTheLimit) {
   ex->WaitUntilIdle();
   EXPECT_EQ(c.ran.load(), kThreads * kEach);
   EXPECT_LE(c.max.load(), 3);
-  EXPECT_GE(c.max.load(), 1);
   EXPECT_EQ(ex->Snapshot().running, 0u);
   EXPECT_EQ(ex->Snapshot().ready, 0u);
 }
 
 TEST(PlinthExecutor, CancelRacingSubmittersNeitherRunsNorLeaksDroppedTasks) {
   auto ex = NewSub(2);
-  std::atomic<int> destroyed{0};
-  std::atomic<int> created{0};
-  std::atomic<int> ran{0};
+  std::atomic<int> destroyed{0}, created{0}, ran{0};
   std::vector<std::thread> threads;
   for (int t = 0; t < 4; ++t) {
     threads.emplace_back([&, t] {
-      for (int i = 0; i < 200; ++i) {
-        auto tr = boost::make_shared<Tracked>(destroyed);
-        ++created;
-        ex->Submit([tr, &ran] { ++ran; }, (t % 2 == 0) ? 0 : 5);
-      }
+      for (int i = 0; i < 200; ++i, ++created)
+        ex->Submit([tr = boost::make_shared<Tracked>(destroyed), &ran] { ++ran; }, (t % 2 == 0) ? 0 : 5);
     });
   }
   std::this_thread::sleep_for(std::chrono::milliseconds(2));
@@ -332,7 +306,6 @@ TEST(PlinthExecutor, CancelRacingSubmittersNeitherRunsNorLeaksDroppedTasks) {
   EXPECT_EQ(destroyed.load(), created.load());
   std::this_thread::sleep_for(std::chrono::milliseconds(20));
   EXPECT_EQ(ran.load(), ranAtIdle);
-  EXPECT_LE(ranAtIdle, 800);
 }
 
 TEST(PlinthExecutor, CancelledParentDropsAChildsTasksAndTheChildStaysWaitable) {
@@ -342,10 +315,8 @@ TEST(PlinthExecutor, CancelledParentDropsAChildsTasksAndTheChildStaysWaitable) {
   constexpr int kTasks = 20000;  // deep enough to overflow a recursive hand-over
   std::atomic<int> destroyed{0};
   std::atomic<int> ran{0};
-  for (int i = 0; i < kTasks; ++i) {
-    auto t = boost::make_shared<Tracked>(destroyed);
-    child->Submit([t, &ran] { ++ran; }, 0);
-  }
+  for (int i = 0; i < kTasks; ++i)
+    child->Submit([t = boost::make_shared<Tracked>(destroyed), &ran] { ++ran; }, 0);
   EXPECT_EQ(child->Snapshot().running, 2u);  // handed to the parent
   EXPECT_EQ(child->Snapshot().ready, static_cast<std::size_t>(kTasks - 2));
   EXPECT_EQ(parent->Snapshot().ready, 2u);
@@ -370,11 +341,9 @@ TEST(PlinthQueueOnlyOnce, OneRunPendingAtATimeAndNoRunAfterDestruction) {
       },
       ex, 60000);
   EXPECT_FALSE(q->IsPending());
-  q->Queue();
-  q->Queue();
-  q->Queue();
+  for (int i = 0; i < 3; ++i) q->Queue();
   EXPECT_TRUE(q->IsPending());
-  EXPECT_EQ(ex->Snapshot().delayedMs, std::vector<std::uint32_t>{60000});
+  EXPECT_EQ(ex->Snapshot().delayedMs, Delays{60000});
   EXPECT_EQ(ex->ExpediteDelayed(), 1u);
   ex->WaitUntilIdle();
   EXPECT_EQ(runs.load(), 1);
@@ -392,8 +361,7 @@ TEST(PlinthQueueOnlyOnce, OneRunPendingAtATimeAndNoRunAfterDestruction) {
 
   // Many threads queueing at once: at most one pending run at any time.
   auto ex2 = NewSub(4);
-  std::atomic<int> runs2{0};
-  auto q2 = boost::make_shared<QueueOnlyOnce>([&] { ++runs2; }, ex2, 60000);
+  auto q2 = boost::make_shared<QueueOnlyOnce>([&] { ++runs; }, ex2, 60000);
   std::vector<std::thread> threads;
   for (int t = 0; t < 6; ++t) {
     threads.emplace_back([&] {
@@ -401,10 +369,10 @@ TEST(PlinthQueueOnlyOnce, OneRunPendingAtATimeAndNoRunAfterDestruction) {
     });
   }
   for (auto& t : threads) t.join();
-  EXPECT_EQ(ex2->Snapshot().delayedMs.size(), 1u);
+  EXPECT_EQ(ex2->Snapshot().delayedMs, Delays{60000});
   EXPECT_EQ(ex2->ExpediteDelayed(), 1u);
   ex2->WaitUntilIdle();
-  EXPECT_EQ(runs2.load(), 1);
+  EXPECT_EQ(runs.load(), 2);
 
   // A run dropped by a cancelled executor leaves the queue free again.
   q2->Queue();
@@ -414,10 +382,8 @@ TEST(PlinthQueueOnlyOnce, OneRunPendingAtATimeAndNoRunAfterDestruction) {
 }
 
 TEST(PlinthThreads, ThreadIdsAreStablePerThreadAndDistinct) {
-  const std::uint64_t mine = GetCurrentThreadID();
-  EXPECT_EQ(GetCurrentThreadID(), mine);
   std::mutex m;
-  std::set<std::uint64_t> ids{mine};
+  std::set<std::uint64_t> ids{GetCurrentThreadID()};
   std::vector<std::thread> threads;
   for (int t = 0; t < 8; ++t) {
     threads.emplace_back([&] {
