@@ -6,6 +6,7 @@
 #include <cstdlib>
 #include <fstream>
 #include <string>
+#include <utility>
 
 #include "host/control.h"
 #include "host/hk.h"
@@ -22,17 +23,24 @@ void WriteFile(const std::string& path, const std::string& text) {
   out << text;
 }
 
+// A read's status and the value it gave.
+using LongRead = std::pair<int, std::int32_t>;
+using FpRead = std::pair<int, double>;
+
 class HostPreferences : public ::testing::Test {
  protected:
   void SetUp() override { ctl::ClearPreferences(); }
   void TearDown() override { ctl::ClearPreferences(); }
 
-  // Reads a long and returns the status; the value goes to *out.
-  static int Long(const char* key, std::int32_t def, std::int32_t* out, const char* section = kSection) {
-    return ST_GetTextPrefLong(ST_GetPrefHandle(0), section, key, def, out);
+  static LongRead Long(const char* key, std::int32_t def, const char* section = kSection) {
+    std::int32_t value = 0;
+    const int status = ST_GetTextPrefLong(ST_GetPrefHandle(0), section, key, def, &value);
+    return {status, value};
   }
-  static int Fp(const char* key, double def, double* out) {
-    return ST_GetTextPrefFpLong(ST_GetPrefHandle(0), kSection, key, def, out);
+  static FpRead Fp(const char* key, double def) {
+    double value = 0;
+    const int status = ST_GetTextPrefFpLong(ST_GetPrefHandle(0), kSection, key, def, &value);
+    return {status, value};
   }
 };
 
@@ -50,52 +58,31 @@ TEST_F(HostPreferences, ValuesFromAnIniFile) {
             "Minimum Volume Free Space (Gigabytes)=3\n");
   ASSERT_TRUE(ctl::LoadPreferencesFile(path));
 
-  std::int32_t l = 0;
-  double d = 0;
-  EXPECT_EQ(0, Long("Minimum Volume Free Space (Gigabytes)", 10, &l));
-  EXPECT_EQ(25, l);
-  EXPECT_EQ(0, Long("Minimum Volume Free Space (Gigabytes)", 10, &l, "Other"));
-  EXPECT_EQ(3, l);
-  EXPECT_EQ(0, Long("Lowest", 10, &l));
-  EXPECT_EQ(INT32_MIN, l);
-  EXPECT_EQ(0, Fp("Proclivity Multiplier 2", 1.0, &d));
-  EXPECT_DOUBLE_EQ(2.5, d);
-  EXPECT_EQ(0, Fp("Dont Include Speeds Above This In Average (bytes/sec) 2", 2147483648.0, &d));
-  EXPECT_DOUBLE_EQ(1e9, d);
-  // An integer is a fine double.
-  EXPECT_EQ(0, Fp("Minimum Volume Free Space (Gigabytes)", 1.0, &d));
-  EXPECT_DOUBLE_EQ(25.0, d);
-
+  EXPECT_EQ(LongRead(0, 25), Long("Minimum Volume Free Space (Gigabytes)", 10));
+  EXPECT_EQ(LongRead(0, 3), Long("Minimum Volume Free Space (Gigabytes)", 10, "Other"));
+  EXPECT_EQ(LongRead(0, INT32_MIN), Long("Lowest", 10));
+  EXPECT_EQ(FpRead(0, 2.5), Fp("Proclivity Multiplier 2", 1.0));
+  EXPECT_EQ(FpRead(0, 1e9), Fp("Dont Include Speeds Above This In Average (bytes/sec) 2", 2147483648.0));
+  EXPECT_EQ(FpRead(0, 25.0),
+            Fp("Minimum Volume Free Space (Gigabytes)", 1.0));  // an integer is a fine double
   // Missing keys and sections give the default and success.
-  l = 0;
-  EXPECT_EQ(0, Long("No Such Key", 10, &l));
-  EXPECT_EQ(10, l);
-  EXPECT_EQ(0, Long("Lowest", 11, &l, "No Such Section"));
-  EXPECT_EQ(11, l);
-  EXPECT_EQ(0, Fp("No Such Key", 1.0, &d));
-  EXPECT_DOUBLE_EQ(1.0, d);
+  EXPECT_EQ(LongRead(0, 10), Long("No Such Key", 10));
+  EXPECT_EQ(LongRead(0, 11), Long("Lowest", 11, "No Such Section"));
+  EXPECT_EQ(FpRead(0, 1.0), Fp("No Such Key", 1.0));
 }
 
 TEST_F(HostPreferences, MalformedValuesGiveTheDefaultAndAStatus) {
-  const char* badLongs[] = {"12abc", "2147483648", "-2147483649", "1.0", "", "0x10", "1 2"};
-  for (const char* text : badLongs) {
+  for (const char* text : {"12abc", "2147483648", "-2147483649", "1.0", "", "0x10", "1 2"}) {
     ctl::SetPreference(kSection, "Value", text);
-    std::int32_t l = 0;
-    EXPECT_EQ(ST_ErrBadValue, Long("Value", 10, &l)) << '"' << text << '"';
-    EXPECT_EQ(10, l) << '"' << text << '"';
+    EXPECT_EQ(LongRead(ST_ErrBadValue, 10), Long("Value", 10)) << '"' << text << '"';
   }
-  const char* badDoubles[] = {"nan", "inf", "-inf", "1e999", "2.5x", "", "one"};
-  for (const char* text : badDoubles) {
+  for (const char* text : {"nan", "inf", "-inf", "1e999", "2.5x", "", "one"}) {
     ctl::SetPreference(kSection, "Value", text);
-    double d = 0;
-    EXPECT_EQ(ST_ErrBadValue, Fp("Value", 1.5, &d)) << '"' << text << '"';
-    EXPECT_DOUBLE_EQ(1.5, d) << '"' << text << '"';
+    EXPECT_EQ(FpRead(ST_ErrBadValue, 1.5), Fp("Value", 1.5)) << '"' << text << '"';
   }
   // Surrounding spaces are allowed in set values as in files.
   ctl::SetPreference(kSection, "Value", "  -42 ");
-  std::int32_t l = 0;
-  EXPECT_EQ(0, Long("Value", 10, &l));
-  EXPECT_EQ(-42, l);
+  EXPECT_EQ(LongRead(0, -42), Long("Value", 10));
 }
 
 TEST_F(HostPreferences, HandlesAndParameters) {
@@ -111,8 +98,7 @@ TEST_F(HostPreferences, HandlesAndParameters) {
   EXPECT_EQ(ST_ErrBadHandle, ST_GetTextPrefFpLong(nullptr, kSection, "Value", 2.0, &d));
   EXPECT_EQ(HK_ErrBadParameter, ST_GetTextPrefLong(ST_GetPrefHandle(0), nullptr, "Value", 10, &l));
   EXPECT_EQ(HK_ErrBadParameter, ST_GetTextPrefLong(ST_GetPrefHandle(0), kSection, "Value", 10, nullptr));
-  EXPECT_EQ(0, ST_GetTextPrefLong(ST_GetPrefHandle(0), kSection, "Value", 10, &l));
-  EXPECT_EQ(5, l);
+  EXPECT_EQ(LongRead(0, 5), Long("Value", 10));
 }
 
 TEST_F(HostPreferences, LoadingReplacesValuesAndAFailedLoadKeepsThem) {
@@ -121,28 +107,19 @@ TEST_F(HostPreferences, LoadingReplacesValuesAndAFailedLoadKeepsThem) {
   WriteFile(good, "[S]\nA=1\n");
   ctl::SetPreference("S", "B", "2");
   ASSERT_TRUE(ctl::LoadPreferencesFile(good));
-  std::int32_t l = 0;
-  EXPECT_EQ(0, Long("A", 0, &l, "S"));
-  EXPECT_EQ(1, l);
-  EXPECT_EQ(0, Long("B", -1, &l, "S"));
-  EXPECT_EQ(-1, l);  // the set value went with the load
+  EXPECT_EQ(LongRead(0, 1), Long("A", 0, "S"));
+  EXPECT_EQ(LongRead(0, -1), Long("B", -1, "S"));  // the set value went with the load
 
-  const std::string broken = dir.Path() + "/broken.ini";
-  WriteFile(broken, "[S\nA=9\n");
-  EXPECT_FALSE(ctl::LoadPreferencesFile(broken));
-  const std::string duplicate = dir.Path() + "/duplicate.ini";
-  WriteFile(duplicate, "[S]\nA=9\nA=10\n");
-  EXPECT_FALSE(ctl::LoadPreferencesFile(duplicate));
-  EXPECT_FALSE(ctl::LoadPreferencesFile(dir.Path() + "/missing.ini"));
-  EXPECT_EQ(0, Long("A", 0, &l, "S"));
-  EXPECT_EQ(1, l);
+  WriteFile(dir.Path() + "/broken.ini", "[S\nA=9\n");
+  WriteFile(dir.Path() + "/duplicate.ini", "[S]\nA=9\nA=10\n");
+  for (const char* name : {"/broken.ini", "/duplicate.ini", "/missing.ini"})
+    EXPECT_FALSE(ctl::LoadPreferencesFile(dir.Path() + name)) << name;
+  EXPECT_EQ(LongRead(0, 1), Long("A", 0, "S"));
 
   ctl::SetPreference("S", "A", "7");
-  EXPECT_EQ(0, Long("A", 0, &l, "S"));
-  EXPECT_EQ(7, l);
+  EXPECT_EQ(LongRead(0, 7), Long("A", 0, "S"));
   ctl::ClearPreferences();
-  EXPECT_EQ(0, Long("A", 0, &l, "S"));
-  EXPECT_EQ(0, l);
+  EXPECT_EQ(LongRead(0, 0), Long("A", 0, "S"));
 }
 
 // The environment variable is read when the store is first used, so the

@@ -3,6 +3,7 @@
 #include <gtest/gtest.h>
 
 #include <algorithm>
+#include <iterator>
 #include <new>
 #include <stdexcept>
 #include <string>
@@ -41,13 +42,26 @@ int CountLines(const ctl::Captured& c, const std::string& tag) {
   return n;
 }
 
-TEST_F(HostServices, MainThreadIsTheInitialOneUntilTheHostNamesAnother) {
+TEST_F(HostServices, MainThreadIsTheInitialOneAndTheRenderMarkIsPerThread) {
   // The test body runs on the thread that loaded the library.
   EXPECT_TRUE(HK_IsOnMainThread());
-  bool otherIsMain = true;
-  OnOtherThread([&] { otherIsMain = HK_IsOnMainThread(); });
+  EXPECT_FALSE(HK_IsOnRenderThread());
+  bool otherIsMain = true, marked = false, freshThreadMarked = true, unmarked = true;
+  OnOtherThread([&] {
+    otherIsMain = HK_IsOnMainThread();
+    ctl::SetCurrentThreadIsRenderThread(true);
+    marked = HK_IsOnRenderThread();
+    OnOtherThread([&] { freshThreadMarked = HK_IsOnRenderThread(); });
+    ctl::SetCurrentThreadIsRenderThread(false);
+    unmarked = HK_IsOnRenderThread();
+  });
   EXPECT_FALSE(otherIsMain);
+  EXPECT_TRUE(marked);
+  EXPECT_FALSE(freshThreadMarked);
+  EXPECT_FALSE(unmarked);
+  EXPECT_FALSE(HK_IsOnRenderThread());
 
+  // The host may name another thread the main one.
   bool mainAfterMove = false;
   OnOtherThread([&] {
     ctl::MakeCurrentThreadMain();
@@ -55,49 +69,41 @@ TEST_F(HostServices, MainThreadIsTheInitialOneUntilTheHostNamesAnother) {
   });
   EXPECT_TRUE(mainAfterMove);
   EXPECT_FALSE(HK_IsOnMainThread());
-
   ctl::MakeCurrentThreadMain();
   EXPECT_TRUE(HK_IsOnMainThread());
 }
 
-TEST_F(HostServices, RenderThreadMarkIsPerThread) {
-  EXPECT_FALSE(HK_IsOnRenderThread());
-  bool marked = false;
-  bool unmarked = true;
-  bool freshThread = true;
-  OnOtherThread([&] {
-    ctl::SetCurrentThreadIsRenderThread(true);
-    marked = HK_IsOnRenderThread();
-    OnOtherThread([&] { freshThread = HK_IsOnRenderThread(); });
-    ctl::SetCurrentThreadIsRenderThread(false);
-    unmarked = HK_IsOnRenderThread();
-  });
-  EXPECT_TRUE(marked);
-  EXPECT_FALSE(freshThread);
-  EXPECT_FALSE(unmarked);
-  EXPECT_FALSE(HK_IsOnRenderThread());
-}
-
-TEST_F(HostServices, ReportsAreCapturedExactlyAndSuppressedWhileQuiet) {
+TEST_F(HostServices, ReportsAreCapturedExactlyAndSuppressedOnlyOnTheQuietThread) {
   HKp_ReportErrString(0x3A0000, 2, "internal structure damaged");
   ASSERT_EQ(0, HK_StartQuietErrorsOnCurrentThread(true));
+  bool otherQuiet = true;
+  OnOtherThread([&] {
+    otherQuiet = HK_AreErrorsQuietOnCurrentThread();
+    HKp_ReportErrString(0x3A0000, 9, "from the other thread");
+  });
   HKp_ReportErrString(0x3A0000, 8, "cannot resize or move disk cache");
   HK_EndQuietErrorsOnCurrentThread();
   HKp_ReportErrString(0x3A0000, 2, nullptr);
+  EXPECT_FALSE(otherQuiet);
 
   const ctl::Captured c = ctl::Snapshot();
-  ASSERT_EQ(3u, c.errorReports.size());
-  EXPECT_EQ(0x3A0000, c.errorReports[0].group);
-  EXPECT_EQ(2, c.errorReports[0].number);
-  EXPECT_EQ("internal structure damaged", c.errorReports[0].detail);
-  EXPECT_FALSE(c.errorReports[0].suppressed);
-  EXPECT_EQ(8, c.errorReports[1].number);
-  EXPECT_EQ("cannot resize or move disk cache", c.errorReports[1].detail);
-  EXPECT_TRUE(c.errorReports[1].suppressed);
-  EXPECT_EQ("", c.errorReports[2].detail);
-  EXPECT_FALSE(c.errorReports[2].suppressed);
+  const struct {
+    int number;
+    const char* detail;
+    bool suppressed;
+  } expected[] = {{2, "internal structure damaged", false},
+                  {9, "from the other thread", false},
+                  {8, "cannot resize or move disk cache", true},
+                  {2, "", false}};
+  ASSERT_EQ(std::size(expected), c.errorReports.size());
+  for (std::size_t i = 0; i < std::size(expected); ++i) {
+    EXPECT_EQ(0x3A0000, c.errorReports[i].group) << i;
+    EXPECT_EQ(expected[i].number, c.errorReports[i].number) << i;
+    EXPECT_EQ(expected[i].detail, c.errorReports[i].detail) << i;
+    EXPECT_EQ(expected[i].suppressed, c.errorReports[i].suppressed) << i;
+  }
   // Shown reports and suppressed ones reach the log under different tags.
-  EXPECT_EQ(2, CountLines(c, "Error"));
+  EXPECT_EQ(3, CountLines(c, "Error"));
   EXPECT_EQ(1, CountLines(c, "SuppressedError"));
 
   ctl::ClearCaptured();
@@ -105,13 +111,13 @@ TEST_F(HostServices, ReportsAreCapturedExactlyAndSuppressedWhileQuiet) {
   EXPECT_TRUE(ctl::Snapshot().logLines.empty());
 }
 
-TEST_F(HostServices, QuietErrorsNestAndTheInnermostBracketDecides) {
+TEST_F(HostServices, QuietErrorsNestAndOnlyBalancedBracketsCount) {
   EXPECT_FALSE(HK_AreErrorsQuietOnCurrentThread());
   ASSERT_EQ(0, HK_StartQuietErrorsOnCurrentThread(true));
   ASSERT_EQ(0, HK_StartQuietErrorsOnCurrentThread(true));
   HK_EndQuietErrorsOnCurrentThread();
   EXPECT_TRUE(HK_AreErrorsQuietOnCurrentThread());
-  ASSERT_EQ(0, HK_StartQuietErrorsOnCurrentThread(false));
+  ASSERT_EQ(0, HK_StartQuietErrorsOnCurrentThread(false));  // the innermost bracket decides
   EXPECT_FALSE(HK_AreErrorsQuietOnCurrentThread());
   HK_EndQuietErrorsOnCurrentThread();
   EXPECT_TRUE(HK_AreErrorsQuietOnCurrentThread());
@@ -121,41 +127,18 @@ TEST_F(HostServices, QuietErrorsNestAndTheInnermostBracketDecides) {
   // An end without a start is logged and changes nothing.
   HK_EndQuietErrorsOnCurrentThread();
   EXPECT_FALSE(HK_AreErrorsQuietOnCurrentThread());
-  ASSERT_EQ(0, HK_StartQuietErrorsOnCurrentThread(true));
-  EXPECT_TRUE(HK_AreErrorsQuietOnCurrentThread());
-  HK_EndQuietErrorsOnCurrentThread();
   EXPECT_EQ(1, CountLines(ctl::Snapshot(), "QuietErrors"));
-}
 
-TEST_F(HostServices, QuietOnOneThreadDoesNotSuppressAnother) {
-  ASSERT_EQ(0, HK_StartQuietErrorsOnCurrentThread(true));
-  bool otherQuiet = true;
-  OnOtherThread([&] {
-    otherQuiet = HK_AreErrorsQuietOnCurrentThread();
-    HKp_ReportErrString(0x3A0000, 2, "from the other thread");
-  });
-  HKp_ReportErrString(0x3A0000, 2, "from the quiet thread");
-  HK_EndQuietErrorsOnCurrentThread();
-
-  EXPECT_FALSE(otherQuiet);
-  const ctl::Captured c = ctl::Snapshot();
-  ASSERT_EQ(2u, c.errorReports.size());
-  EXPECT_EQ("from the other thread", c.errorReports[0].detail);
-  EXPECT_FALSE(c.errorReports[0].suppressed);
-  EXPECT_EQ("from the quiet thread", c.errorReports[1].detail);
-  EXPECT_TRUE(c.errorReports[1].suppressed);
-}
-
-TEST_F(HostServices, ForcedStartFailureOpensNoBracket) {
+  // A failed start opens no bracket and owes no end.
   ctl::FailStartQuietErrors(0x1234);
   EXPECT_EQ(0x1234, HK_StartQuietErrorsOnCurrentThread(true));
   EXPECT_FALSE(HK_AreErrorsQuietOnCurrentThread());
   ctl::FailStartQuietErrors(0);
-  EXPECT_EQ(0, HK_StartQuietErrorsOnCurrentThread(true));
+  ASSERT_EQ(0, HK_StartQuietErrorsOnCurrentThread(true));
+  EXPECT_TRUE(HK_AreErrorsQuietOnCurrentThread());
   HK_EndQuietErrorsOnCurrentThread();
   EXPECT_FALSE(HK_AreErrorsQuietOnCurrentThread());
-  // The failed start owed no end: nothing was unbalanced.
-  EXPECT_EQ(0, CountLines(ctl::Snapshot(), "QuietErrors"));
+  EXPECT_EQ(1, CountLines(ctl::Snapshot(), "QuietErrors"));
 }
 
 TEST_F(HostServices, VerificationsAreRecordedAndLogged) {

@@ -7,6 +7,7 @@
 #include <optional>
 #include <stdexcept>
 #include <string>
+#include <utility>
 
 #include "host/control.h"
 #include "host/hk.h"
@@ -30,27 +31,12 @@ HK_LStrCacheRec g_table{"T", 5, g_entries};
 HK_LStrCacheRec g_overcounted{"T", 6, g_entries};
 
 TEST(HostStrings, MessageTableLookup) {
-  EXPECT_EQ("zero", HK_ZLookupLStrCache(&g_table, 0, 0, 0));
-  EXPECT_EQ("a=b keeps its second equals sign", HK_ZLookupLStrCache(&g_table, 1, 0, 0));
-  EXPECT_EQ("disk full", HK_ZLookupLStrCache(&g_table, 2, 0, 0));
-  EXPECT_EQ("", HK_ZLookupLStrCache(&g_table, 3, 0, 0));
+  const char* const expected[] = {"zero", "a=b keeps its second equals sign", "disk full", ""};
+  for (int i = 0; i < 4; ++i) EXPECT_EQ(expected[i], HK_ZLookupLStrCache(&g_table, i, 0, 0)) << i;
   // The terminator and anything outside the table give "".
-  EXPECT_EQ("", HK_ZLookupLStrCache(&g_table, 4, 0, 0));
-  EXPECT_EQ("", HK_ZLookupLStrCache(&g_table, 5, 0, 0));
-  EXPECT_EQ("", HK_ZLookupLStrCache(&g_table, -1, 0, 0));
-  EXPECT_EQ("", HK_ZLookupLStrCache(&g_table, 1 << 30, 0, 0));
+  for (int i : {4, 5, -1, 1 << 30}) EXPECT_EQ("", HK_ZLookupLStrCache(&g_table, i, 0, 0)) << i;
   EXPECT_EQ("", HK_ZLookupLStrCache(&g_overcounted, 5, 0, 0));
   EXPECT_EQ("", HK_ZLookupLStrCache(nullptr, 0, 0, 0));
-}
-
-TEST(HostStrings, KeyAndTextGivesTheText) {
-  EXPECT_EQ(
-      "Cannot write to the disk cache folder.",
-      HK_ZStringToMBString("$$$/VX/RK/DiskCacheFolderCantWrite=Cannot write to the disk cache folder."));
-  EXPECT_EQ("Folder missing", HK_ZStringToMBString("$$$/K=Folder missing{{*COMMENT*}}note=with equals"));
-  EXPECT_EQ("no key at all", HK_ZStringToMBString("no key at all"));
-  EXPECT_EQ("", HK_ZStringToMBString("$$$/K="));
-  EXPECT_EQ("", HK_ZStringToMBString(nullptr));
 }
 
 TEST(HostStrings, Utf8AndUtf16Conversions) {
@@ -99,36 +85,37 @@ TEST(HostStrings, CopyStringCutsToFitAndTerminates) {
   EXPECT_EQ('z', buffer[0]);
 }
 
+// The status and the text of a computer-name read into `size` bytes of a
+// buffer filled with 'z' (so a missing terminator shows).
+std::pair<int, std::string> ComputerName(int size = 64) {
+  char buffer[65];
+  std::memset(buffer, 'z', 64);
+  buffer[64] = '\0';
+  const int status = HK_GetComputerName(size, buffer);
+  return {status, buffer};
+}
+
 TEST(HostStrings, ComputerNameFromSystemOrOverride) {
   char system[256] = {};
   ASSERT_EQ(0, gethostname(system, sizeof system - 1));
-  char buffer[64];
-  ASSERT_EQ(0, HK_GetComputerName(sizeof buffer, buffer));
-  EXPECT_EQ(std::string(system).substr(0, 63), buffer);
+  using Read = std::pair<int, std::string>;
+  EXPECT_EQ(Read(0, std::string(system).substr(0, 63)), ComputerName());
 
   ctl::SetComputerName(std::string("WS-07"));
-  ASSERT_EQ(0, HK_GetComputerName(sizeof buffer, buffer));
-  EXPECT_STREQ("WS-07", buffer);
-  ASSERT_EQ(0, HK_GetComputerName(3, buffer));
-  EXPECT_STREQ("WS", buffer);
-  EXPECT_EQ(HK_ErrBadParameter, HK_GetComputerName(0, buffer));
+  EXPECT_EQ(Read(0, "WS-07"), ComputerName());
+  EXPECT_EQ(Read(0, "WS"), ComputerName(3));
+  EXPECT_EQ(HK_ErrBadParameter, ComputerName(0).first);
   EXPECT_EQ(HK_ErrBadParameter, HK_GetComputerName(64, nullptr));
-
   ctl::SetComputerName(std::string(100, 'n'));
-  ASSERT_EQ(0, HK_GetComputerName(sizeof buffer, buffer));
-  EXPECT_EQ(std::string(63, 'n'), buffer);
-
+  EXPECT_EQ(Read(0, std::string(63, 'n')), ComputerName());
   ctl::SetComputerName(std::string());
-  ASSERT_EQ(0, HK_GetComputerName(sizeof buffer, buffer));
-  EXPECT_STREQ("", buffer);
-
+  EXPECT_EQ(Read(0, ""), ComputerName());
   ctl::FailComputerName(0x77);
-  EXPECT_EQ(0x77, HK_GetComputerName(sizeof buffer, buffer));
+  EXPECT_EQ(0x77, ComputerName().first);
   ctl::FailComputerName(0);
 
   ctl::SetComputerName(std::nullopt);
-  ASSERT_EQ(0, HK_GetComputerName(sizeof buffer, buffer));
-  EXPECT_EQ(std::string(system).substr(0, 63), buffer);
+  EXPECT_EQ(Read(0, std::string(system).substr(0, 63)), ComputerName());
 }
 
 }  // namespace
