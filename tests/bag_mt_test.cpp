@@ -38,6 +38,11 @@ TEST(BagConcurrencyTest, EnteringAndFreeingConcurrentlyKeepsBagDirectoryAndStati
   // Every writer also enters items of one GUID that it shares with the
   // others; those supersede each other (only the newest may survive).
   const auto shared = TestStuff::Make();
+  const auto destroyed = [&] {
+    int n = 0;
+    for (int w = 0; w < kWriters; ++w) n += journal->Count("w" + std::to_string(w) + ":destroyed");
+    return n;
+  };
   std::atomic<bool> writersDone{false};
   std::atomic<int> queries{0};
 
@@ -90,9 +95,7 @@ TEST(BagConcurrencyTest, EnteringAndFreeingConcurrentlyKeepsBagDirectoryAndStati
   // The shared GUID's items supersede each other: at most one survives.
   EXPECT_LE(sharedGroup, 1);
   // Every item entered either is still held or was destroyed, exactly once.
-  int destroyed = 0;
-  for (int w = 0; w < kWriters; ++w) destroyed += journal->Count("w" + std::to_string(w) + ":destroyed");
-  EXPECT_EQ(destroyed + static_cast<int>(inBag.size()), kWriters * kPerWriter);
+  EXPECT_EQ(destroyed() + static_cast<int>(inBag.size()), kWriters * kPerWriter);
   // The statistic moved only by what the surviving items hold.
   EXPECT_EQ(rkhost::control::MemoryStat() - base, inMemoryBytes);
   EXPECT_TRUE(rkhost::control::Snapshot().verifications.empty());
@@ -103,9 +106,7 @@ TEST(BagConcurrencyTest, EnteringAndFreeingConcurrentlyKeepsBagDirectoryAndStati
   RK_StopAllAsyncWork();
   RK_Death();
   // The directory's end released every item; none is left behind.
-  destroyed = 0;
-  for (int w = 0; w < kWriters; ++w) destroyed += journal->Count("w" + std::to_string(w) + ":destroyed");
-  EXPECT_EQ(destroyed, kWriters * kPerWriter);
+  EXPECT_EQ(destroyed(), kWriters * kPerWriter);
   EXPECT_EQ(rkhost::control::MemoryStat(), unborn);
 }
 

@@ -18,24 +18,25 @@ namespace ctl = rkhost::control;
 
 namespace {
 
-// "level|module|tag|text" of every captured line of module "RK".
+// "level|tag|text" of every captured line of module "RK".
 std::vector<std::string> ModuleLogLines() {
   std::vector<std::string> out;
-  for (const ctl::LogLine& line : ctl::Snapshot().logLines) {
-    if (line.module == "RK") out.push_back(std::to_string(line.level) + "|RK|" + line.tag + "|" + line.text);
-  }
+  for (const ctl::LogLine& line : ctl::Snapshot().logLines)
+    if (line.module == "RK") out.push_back(std::to_string(line.level) + "|" + line.tag + "|" + line.text);
   return out;
 }
 
-const std::string kBirthLine = "10|RK|Birth|RK Birth";
-const std::string kStopLine = "10|RK|RK_StopAllAsyncWork|RK_StopAllAsyncWork";
-const std::string kDeathLine = "10|RK|Death|RK Death";
+const std::string kBirthLine = "10|Birth|RK Birth";
+const std::string kStopLine = "10|RK_StopAllAsyncWork|RK_StopAllAsyncWork";
+const std::string kDeathLine = "10|Death|RK Death";
+
+std::uint32_t Holds(const boost::shared_ptr<RK_Bag>& bag) { return RK_TEST_Access::LockHoldCount(*bag); }
 
 }  // namespace
 
 TEST(FrameLifecycle, WalksFromNotBornThroughAliveAndStoppedToDead) {
   ctl::ClearCaptured();
-
+  const std::uint64_t unborn = ctl::MemoryStat();
   // Not born: no globals, and the guard still locks without a bag.
   EXPECT_FALSE(RK_GlobalBag());
   EXPECT_FALSE(RK_GlobalSortDir());
@@ -45,26 +46,25 @@ TEST(FrameLifecycle, WalksFromNotBornThroughAliveAndStoppedToDead) {
   RK_Birth(false);
   boost::shared_ptr<RK_Bag> bag = RK_GlobalBag();
   boost::shared_ptr<RK_SortDir> sortDir = RK_GlobalSortDir();
-  boost::shared_ptr<plinth::threads::AsyncThreadedExecutor> executor = RK_TEST_BackgroundExecutor();
-  ASSERT_TRUE(bag);
-  ASSERT_TRUE(sortDir);
-  ASSERT_TRUE(executor);
+  auto executor = RK_TEST_BackgroundExecutor();
+  ASSERT_TRUE(bag && sortDir && executor);
   EXPECT_EQ(RK_GlobalBag(), bag);
-  EXPECT_EQ(RK_GlobalSortDir(), sortDir);
   EXPECT_EQ(bag->GetStuffCount(), 0u);
-  EXPECT_EQ(sortDir->GetStuffCount(), 0u);
   EXPECT_FALSE(executor->IsCancelled());
+  // Bag and directory come from tracked allocation.
+  EXPECT_GE(ctl::MemoryStat() - unborn, sizeof(RK_Bag) + sizeof(RK_SortDir));
   EXPECT_EQ(ModuleLogLines(), std::vector<std::string>{kBirthLine});
 
-  // Stopped: no executor, but bag and sort directory stay usable.
+  // Stopped: no executor, but bag and sort directory stay usable. A second
+  // stop logs again and changes nothing else.
   RK_StopAllAsyncWork();
   EXPECT_TRUE(executor->IsCancelled());
   EXPECT_FALSE(RK_TEST_BackgroundExecutor());
+  RK_StopAllAsyncWork();
   EXPECT_EQ(RK_GlobalBag(), bag);
   EXPECT_EQ(RK_GlobalSortDir(), sortDir);
   rktest::TestStuffPtr item = rktest::TestStuff::Make();
   item->AddToBagAndSortDir(bag, boost::posix_time::milliseconds(1));
-  EXPECT_EQ(bag->GetStuffCount(), 1u);
   EXPECT_EQ(item->GetBag(), bag);
 
   // Dead: both globals dropped; with no other owner both objects go.
@@ -72,6 +72,7 @@ TEST(FrameLifecycle, WalksFromNotBornThroughAliveAndStoppedToDead) {
   boost::weak_ptr<RK_SortDir> sortDirWatch = sortDir;
   bag.reset();
   sortDir.reset();
+  executor.reset();
   RK_Death();
   EXPECT_FALSE(RK_GlobalBag());
   EXPECT_FALSE(RK_GlobalSortDir());
@@ -79,17 +80,9 @@ TEST(FrameLifecycle, WalksFromNotBornThroughAliveAndStoppedToDead) {
   EXPECT_TRUE(sortDirWatch.expired());
   EXPECT_FALSE(item->GetBag());
   { RK_ScCacheLock lock; }
-
-  EXPECT_EQ(ModuleLogLines(), (std::vector<std::string>{kBirthLine, kStopLine, kDeathLine}));
-}
-
-TEST(FrameLifecycle, BagAndSortDirComeFromTrackedAllocation) {
-  const std::uint64_t before = ctl::MemoryStat();
-  RK_Birth(false);
-  EXPECT_GE(ctl::MemoryStat() - before, sizeof(RK_Bag) + sizeof(RK_SortDir));
-  RK_StopAllAsyncWork();
-  RK_Death();
-  EXPECT_EQ(ctl::MemoryStat(), before);
+  EXPECT_EQ(ModuleLogLines(), (std::vector<std::string>{kBirthLine, kStopLine, kStopLine, kDeathLine}));
+  item.reset();
+  EXPECT_EQ(ctl::MemoryStat(), unborn);
 }
 
 TEST(FrameLifecycle, HostReferenceKeepsTheBagAlivePastDeath) {
@@ -98,115 +91,80 @@ TEST(FrameLifecycle, HostReferenceKeepsTheBagAlivePastDeath) {
   boost::weak_ptr<RK_SortDir> sortDirWatch = RK_GlobalSortDir();
   RK_StopAllAsyncWork();
   RK_Death();
-
   EXPECT_TRUE(sortDirWatch.expired());
   EXPECT_FALSE(RK_GlobalBag());
-  ASSERT_TRUE(held);
   // The guard finds no global bag, so the kept bag's count stays untouched.
   {
     RK_ScCacheLock lock;
-    EXPECT_EQ(RK_TEST_Access::LockHoldCount(*held), 0u);
+    EXPECT_EQ(Holds(held), 0u);
   }
-  EXPECT_EQ(held->GetStuffCount(), 0u);
-
   boost::weak_ptr<RK_Bag> bagWatch = held;
-  EXPECT_FALSE(bagWatch.expired());
   held.reset();
   EXPECT_TRUE(bagWatch.expired());
 }
 
-TEST(FrameLifecycle, StoppingTwiceOnlyLogsTheSecondTime) {
-  RK_Birth(false);
-  RK_StopAllAsyncWork();
-  ctl::ClearCaptured();
-  RK_StopAllAsyncWork();
-  EXPECT_EQ(ModuleLogLines(), std::vector<std::string>{kStopLine});
-  EXPECT_FALSE(RK_TEST_BackgroundExecutor());
-  EXPECT_TRUE(RK_GlobalBag());
-  RK_Death();
-  EXPECT_FALSE(RK_GlobalBag());
-}
-
 TEST(FrameLifecycle, StopDropsQueuedAndDelayedTasksEvenWhileSuspended) {
   RK_Birth(false);
-  boost::shared_ptr<plinth::threads::AsyncThreadedExecutor> executor = RK_TEST_BackgroundExecutor();
+  auto executor = RK_TEST_BackgroundExecutor();
   ASSERT_TRUE(executor);
-
   // The token is held only by the tasks: its count shows whether they were
   // destroyed unrun.
   auto token = boost::make_shared<int>(0);
   auto ran = boost::make_shared<std::atomic<int>>(0);
   executor->Submit([token, ran] { ++*ran; }, 60000);
-
   RK_DeprioritizeBackgroundWrites();
   EXPECT_TRUE(executor->Snapshot().suspended);
   executor->Submit([token, ran] { ++*ran; }, 0);
-  const plinth::threads::ExecutorSnapshot held = executor->Snapshot();
-  EXPECT_EQ(held.ready, 1u);
-  EXPECT_EQ(held.delayedMs, std::vector<std::uint32_t>{60000});
+  EXPECT_EQ(executor->Snapshot().ready, 1u);
+  EXPECT_EQ(executor->Snapshot().delayedMs, std::vector<std::uint32_t>{60000});
   EXPECT_EQ(token.use_count(), 3);
 
   RK_StopAllAsyncWork();  // must return although the executor was suspended
-  EXPECT_EQ(ran->load(), 0);
   EXPECT_EQ(token.use_count(), 1);
   const plinth::threads::ExecutorSnapshot after = executor->Snapshot();
   EXPECT_EQ(after.running, 0u);
   EXPECT_EQ(after.ready, 0u);
   EXPECT_TRUE(after.delayedMs.empty());
   EXPECT_TRUE(after.cancelled);
-
   // Nothing submitted to the stopped executor runs either.
   executor->Submit([token, ran] { ++*ran; }, 0);
   executor->WaitUntilIdle();
-  EXPECT_EQ(ran->load(), 0);
   EXPECT_EQ(token.use_count(), 1);
-
   executor.reset();
   RK_Death();
   EXPECT_EQ(ran->load(), 0);
 }
 
-TEST(FrameLifecycle, AGuardHeldAcrossDeathAndRebirthLeavesBothBagsAlone) {
+TEST(FrameLifecycle, GuardsCountOnTheGlobalBagAndOneHeldAcrossDeathLeavesBothBagsAlone) {
   RK_Birth(false);
+  boost::shared_ptr<RK_Bag> bag = RK_GlobalBag();
+  {
+    RK_ScCacheLock outer;
+    EXPECT_EQ(Holds(bag), 1u);
+    {
+      RK_ScCacheLock middle;
+      RK_ScCacheLock inner;
+      EXPECT_EQ(Holds(bag), 3u);
+      EXPECT_EQ(bag->GetStuffCount(), 0u);  // the bag's own operations lock again on this thread
+    }
+    EXPECT_EQ(Holds(bag), 1u);
+  }
+  EXPECT_EQ(Holds(bag), 0u);
+  bag.reset();
+
   RK_StopAllAsyncWork();
   {
     RK_ScCacheLock guard;
     RK_Death();  // destroys the bag the guard raised
     RK_Birth(false);
     boost::shared_ptr<RK_Bag> fresh = RK_GlobalBag();
-    EXPECT_EQ(RK_TEST_Access::LockHoldCount(*fresh), 0u);
+    EXPECT_EQ(Holds(fresh), 0u);
     {
       RK_ScCacheLock inner;
-      EXPECT_EQ(RK_TEST_Access::LockHoldCount(*fresh), 1u);
+      EXPECT_EQ(Holds(fresh), 1u);
     }
   }  // the outer guard touches neither the dead bag nor the new one
-  EXPECT_EQ(RK_TEST_Access::LockHoldCount(*RK_GlobalBag()), 0u);
+  EXPECT_EQ(Holds(RK_GlobalBag()), 0u);
   RK_StopAllAsyncWork();
-  RK_Death();
-}
-
-TEST(FrameLifecycle, NestedGuardsCountOnTheGlobalBag) {
-  RK_Birth(false);
-  boost::shared_ptr<RK_Bag> bag = RK_GlobalBag();
-  ASSERT_TRUE(bag);
-  EXPECT_EQ(RK_TEST_Access::LockHoldCount(*bag), 0u);
-  {
-    RK_ScCacheLock outer;
-    EXPECT_EQ(RK_TEST_Access::LockHoldCount(*bag), 1u);
-    {
-      RK_ScCacheLock middle;
-      {
-        RK_ScCacheLock inner;
-        EXPECT_EQ(RK_TEST_Access::LockHoldCount(*bag), 3u);
-        // The bag's own operations take the lock again on this thread.
-        EXPECT_EQ(bag->GetStuffCount(), 0u);
-      }
-      EXPECT_EQ(RK_TEST_Access::LockHoldCount(*bag), 2u);
-    }
-    EXPECT_EQ(RK_TEST_Access::LockHoldCount(*bag), 1u);
-  }
-  EXPECT_EQ(RK_TEST_Access::LockHoldCount(*bag), 0u);
-  RK_StopAllAsyncWork();
-  bag.reset();
   RK_Death();
 }

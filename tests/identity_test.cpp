@@ -2,28 +2,17 @@
 // with the bag's total, the change counter and the main-thread notification.
 // Deletion is private to the module; it is reached here the way the module
 // reaches it: a conversion to writeable makes the cached copy stale.
-#include <gtest/gtest.h>
-
-#include <boost/date_time/posix_time/posix_time.hpp>
 #include <string>
-#include <thread>
 #include <vector>
 
-#include "host/control.h"
-#include "rkcache/rkcache.h"
 #include "support/file_stuff.h"
-#include "support/temp_dir.h"
-#include "support/test_access.h"
-#include "support/test_stuff.h"
+#include "support/module_fixture.h"
 
 namespace {
 
-using boost::posix_time::time_duration;
-using rktest::Journal;
-using rktest::TestStuff;
 using rktest::TestStuffPtr;
 
-class IdentityTest : public ::testing::Test {
+class IdentityTest : public rktest::ModuleTest {
  protected:
   // Deletes the item's cache file through a conversion to writeable, and
   // ends that check-out keeping the item's last use.
@@ -31,40 +20,22 @@ class IdentityTest : public ::testing::Test {
     ASSERT_EQ(item.Checkout(RK_Checkout_ReadOnly | RK_Checkout_EvenIfNotInMemory),
               RK_CheckoutResult_CheckedOut);
     item.ConvertToWriteable();
-    item.Checkin(RK_Checkin_KeepLastUse, time_duration());
+    item.Checkin(RK_Checkin_KeepLastUse, {});
   }
-
-  void SetUp() override {
-    rkhost::control::MakeCurrentThreadMain();
-    RK_Birth(false);
-    rkhost::control::ClearCaptured();
-    bag = RK_GlobalBag();
-    dir = RK_GlobalSortDir();
-    journal = std::make_shared<Journal>();
-  }
-  void TearDown() override {
-    bag.reset();
-    dir.reset();
-    RK_StopAllAsyncWork();
-    RK_Death();
+  TestStuffPtr WithFile(TestStuffPtr item, std::size_t bytes) {
+    RK_TEST_Access::SetDiskCacheFile(
+        *item, rktest::WriteFile(folder, item->Name() + ".vxcache", rktest::CountingBytes(bytes)));
+    return item;
   }
   TestStuffPtr EnterWithFile(const std::string& name, std::size_t bytes) {
-    TestStuffPtr item = TestStuff::Make(static_cast<std::uint32_t>(bytes), true, false, journal, name);
-    item->AddToBagAndSortDir(bag, time_duration());
-    RK_TEST_Access::SetDiskCacheFile(
-        *item, rktest::WriteFile(folder, name + ".vxcache", rktest::CountingBytes(bytes)));
-    return item;
+    return WithFile(Enter(Make(name, static_cast<std::uint32_t>(bytes))), bytes);
   }
 
   rktest::TempDir folder;
-  boost::shared_ptr<RK_Bag> bag;
-  boost::shared_ptr<RK_SortDir> dir;
-  std::shared_ptr<Journal> journal;
 };
 
 TEST_F(IdentityTest, GetDiskCacheFileCopiesTheFileOrGivesAnEmptyOne) {
-  TestStuffPtr none = TestStuff::Make();
-  EXPECT_TRUE(none->GetDiskCacheFile().IsEmpty());
+  TestStuffPtr none = rktest::TestStuff::Make();
   none->SetOnDisk(true);  // claims to be on disk without holding a file
   EXPECT_TRUE(none->GetDiskCacheFile().IsEmpty());
 
@@ -88,7 +59,7 @@ TEST_F(IdentityTest, DeletionRemovesTheFileUnchargesItsSizeAndCountsAChange) {
   EXPECT_EQ(bag->GetCurrentDiskCacheSize(), 10000 - 4096);
   // Leaving the directory, the deletion, and coming back.
   EXPECT_EQ(dir->GetLastChangeTime(), changes + 3);
-  EXPECT_EQ(journal->Events(), (std::vector<std::string>{"a:YourDiskCacheFileWasDeleted"}));
+  EXPECT_EQ(journal->Events(), std::vector<std::string>{"a:YourDiskCacheFileWasDeleted"});
 
   // Nothing left to delete: the deletion changes nothing.
   DeleteCacheFile(*item);
@@ -103,13 +74,7 @@ TEST_F(IdentityTest, OnlyTheMainThreadNotifiesTheItem) {
   RK_TEST_Access::SetDiskCacheSize(*bag, 200);
   const plinth::filesupport::File fileA = a->GetDiskCacheFile();
   const auto changes = dir->GetLastChangeTime();
-  for (bool render : {true, false}) {
-    std::thread other([&, render] {
-      rkhost::control::SetCurrentThreadIsRenderThread(render);
-      DeleteCacheFile(render ? *a : *b);
-    });
-    other.join();
-  }
+  for (bool render : {true, false}) rktest::OnThread(render, [&] { DeleteCacheFile(render ? *a : *b); });
   EXPECT_FALSE(fileA.Exists());
   EXPECT_FALSE(a->IsOnDisk());
   EXPECT_FALSE(b->IsOnDisk());
@@ -123,8 +88,7 @@ TEST_F(IdentityTest, FailuresToMeasureOrDeleteAreSwallowedAndAnOrphanedItemStill
   // delete, but the item loses its link and nothing is un-charged.
   TestStuffPtr a = EnterWithFile("a", 100);
   RK_TEST_Access::SetDiskCacheSize(*bag, 500);
-  const plinth::filesupport::File file = a->GetDiskCacheFile();
-  file.Delete();
+  a->GetDiskCacheFile().Delete();
   DeleteCacheFile(*a);
   EXPECT_FALSE(a->IsOnDisk());
   EXPECT_EQ(bag->GetCurrentDiskCacheSize(), 500);
@@ -132,16 +96,13 @@ TEST_F(IdentityTest, FailuresToMeasureOrDeleteAreSwallowedAndAnOrphanedItemStill
   EXPECT_TRUE(rkhost::control::Snapshot().exceptions.empty());
 
   // An item whose bag is gone still has its file deleted.
-  TestStuffPtr orphan = TestStuff::Make(10, true, false, journal, "o");
-  {
-    boost::shared_ptr<RK_Bag> other(new RK_Bag);
-    other->AddStuff(orphan);
-  }
+  TestStuffPtr orphan = Make("o", 10);
+  boost::shared_ptr<RK_Bag>(new RK_Bag)->AddStuff(orphan);
   EXPECT_FALSE(orphan->GetBag());
-  auto orphanFile = rktest::WriteFile(folder, "o.vxcache", rktest::CountingBytes(10));
-  RK_TEST_Access::SetDiskCacheFile(*orphan, orphanFile);
+  WithFile(orphan, 10);
+  const plinth::filesupport::File orphanFile = orphan->GetDiskCacheFile();
   DeleteCacheFile(*orphan);
-  EXPECT_FALSE(orphanFile->Exists());
+  EXPECT_FALSE(orphanFile.Exists());
   EXPECT_FALSE(orphan->IsOnDisk());
   EXPECT_EQ(bag->GetCurrentDiskCacheSize(), 500);
 }

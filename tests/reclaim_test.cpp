@@ -1,55 +1,39 @@
 // Memory reclamation driven by the host's memory statistic 6: the two
 // passes, where they stop, what they never touch, nesting, the log line.
-#include <gtest/gtest.h>
-
+#include <algorithm>
 #include <string>
 #include <vector>
 
-#include "host/control.h"
-#include "rkcache/rkcache.h"
-#include "support/test_access.h"
-#include "support/test_stuff.h"
+#include "support/module_fixture.h"
 
 namespace {
 
-using rktest::Journal;
-using rktest::TestStuff;
-using rktest::TestStuffPtr;
+using rktest::ThrownCode;
+using Lines = std::vector<std::string>;
 
-class ReclaimTest : public ::testing::Test {
+class ReclaimTest : public rktest::ModuleTest {
  protected:
   void SetUp() override {
-    rkhost::control::MakeCurrentThreadMain();
-    RK_Birth(false);
-    bag = RK_GlobalBag();
-    dir = RK_GlobalSortDir();
+    ModuleTest::SetUp();
     rkhost::control::SetMemoryStat(1000000);
-    rkhost::control::ClearCaptured();
   }
   void TearDown() override {
     rkhost::control::FailMemoryStat(0);
-    bag.reset();
-    dir.reset();
-    RK_StopAllAsyncWork();
-    RK_Death();
+    ModuleTest::TearDown();
   }
-
   // Enters `count` items of 100 tracked bytes, oldest first; those whose
   // index is in onDisk also live on disk. The cache holds the only reference.
-  std::vector<RK_Stuff*> Enter(int count, std::vector<int> onDisk = {}, bool track = true) {
+  std::vector<RK_Stuff*> EnterItems(int count, std::vector<int> onDisk = {}, bool track = true) {
     std::vector<RK_Stuff*> out;
     for (int i = 0; i < count; ++i) {
-      auto item = TestStuff::Make(100, true, track, journal, "i" + std::to_string(i));
-      bool disk = false;
-      for (int d : onDisk) disk = disk || d == i;
-      item->SetOnDisk(disk);
-      item->AddToBagAndSortDir(bag, {});
-      out.push_back(item.get());
+      auto item = Make("i" + std::to_string(i), 100, true, track);
+      item->SetOnDisk(std::find(onDisk.begin(), onDisk.end(), i) != onDisk.end());
+      out.push_back(Enter(item).get());
     }
     return out;
   }
-  std::vector<std::string> PurgeLines() const {
-    std::vector<std::string> out;
+  static Lines PurgeLines() {
+    Lines out;
     for (const auto& line : rkhost::control::Snapshot().logLines)
       if (line.tag == "PURGE_STATS") {
         EXPECT_EQ(line.module, "RK");
@@ -58,121 +42,98 @@ class ReclaimTest : public ::testing::Test {
       }
     return out;
   }
-
-  boost::shared_ptr<RK_Bag> bag;
-  boost::shared_ptr<RK_SortDir> dir;
-  std::shared_ptr<Journal> journal = std::make_shared<Journal>();
+  static std::uint64_t Stat() { return rkhost::control::MemoryStat(); }
 };
 
 TEST_F(ReclaimTest, FreesDiskBackedMemoryFirstThenDropsOldestMemoryOnlyItems) {
-  auto items = Enter(5, {1, 3});
-  const auto stat = rkhost::control::MemoryStat();
-  ASSERT_EQ(stat, 1000500u);
+  auto items = EnterItems(5, {1, 3});
+  ASSERT_EQ(Stat(), 1000500u);
   const auto changes = dir->GetLastChangeTime();
-
   // Pass 1 frees i1 and i3 (200), pass 2 drops i0 (300 > 250) and stops.
   EXPECT_EQ(bag->FreeUpSomeMemory(250), RK_Bag::FreeUpResult_FreedEnough);
-  EXPECT_EQ(rkhost::control::MemoryStat(), 1000200u);
-  EXPECT_EQ(PurgeLines(), std::vector<std::string>{"numFreed:1, numWalked:6, Total: 4"});
+  EXPECT_EQ(Stat(), 1000200u);
+  EXPECT_EQ(PurgeLines(), Lines{"numFreed:1, numWalked:6, Total: 4"});
   EXPECT_EQ(journal->Count("i0:destroyed"), 1);
   // The disk-backed items stay, without their memory.
-  EXPECT_EQ(RK_TEST_Access::Order(*bag), (std::vector<RK_Stuff*>{items[1], items[2], items[3], items[4]}));
+  EXPECT_EQ(Order(), (std::vector<RK_Stuff*>{items[1], items[2], items[3], items[4]}));
   EXPECT_FALSE(items[1]->IsInMemory());
   EXPECT_FALSE(items[3]->IsInMemory());
-  EXPECT_TRUE(items[2]->IsInMemory());
   // Two memory releases and one removal moved the change count.
   EXPECT_EQ(dir->GetLastChangeTime(), changes + 3);
 }
 
 TEST_F(ReclaimTest, ResultsAtTheEdges) {
-  auto items = Enter(4, {0, 1, 2, 3});
+  EnterItems(4, {0, 1, 2, 3});
   // Everything is on disk and freeing it all is not enough: FreedSome,
   // pass 2 walks every item and drops none.
   EXPECT_EQ(bag->FreeUpSomeMemory(10000), RK_Bag::FreeUpResult_FreedSome);
-  EXPECT_EQ(rkhost::control::MemoryStat(), 1000000u);
+  EXPECT_EQ(Stat(), 1000000u);
   EXPECT_EQ(bag->GetStuffCount(), 4u);
   // Nothing left to free: the statistic never falls.
   EXPECT_EQ(bag->FreeUpSomeMemory(0), RK_Bag::FreeUpResult_NothingFreed);
-  EXPECT_EQ(PurgeLines(), (std::vector<std::string>{"numFreed:0, numWalked:8, Total: 4",
-                                                    "numFreed:0, numWalked:8, Total: 4"}));
+  EXPECT_EQ(PurgeLines(), (Lines{"numFreed:0, numWalked:8, Total: 4", "numFreed:0, numWalked:8, Total: 4"}));
 }
 
 TEST_F(ReclaimTest, WantedZeroStopsAtTheFirstDrop) {
-  Enter(3);
+  EnterItems(3);
   EXPECT_EQ(bag->FreeUpSomeMemory(0), RK_Bag::FreeUpResult_FreedEnough);
-  EXPECT_EQ(rkhost::control::MemoryStat(), 1000200u);
-  EXPECT_EQ(bag->GetStuffCount(), 2u);
+  EXPECT_EQ(Stat(), 1000200u);
   EXPECT_EQ(journal->Count("i0:destroyed"), 1);
-  EXPECT_EQ(PurgeLines(), std::vector<std::string>{"numFreed:1, numWalked:4, Total: 2"});
+  EXPECT_EQ(PurgeLines(), Lines{"numFreed:1, numWalked:4, Total: 2"});
 }
 
 TEST_F(ReclaimTest, UntrackedItemsAreDroppedButNothingCountsAsFreed) {
   // The statistic does not see these items: every one is walked in both
   // passes and dropped in the second, and the result is NothingFreed.
-  Enter(3, {}, false);
+  EnterItems(3, {}, false);
   EXPECT_EQ(bag->FreeUpSomeMemory(50), RK_Bag::FreeUpResult_NothingFreed);
   EXPECT_EQ(bag->GetStuffCount(), 0u);
-  EXPECT_EQ(PurgeLines(), std::vector<std::string>{"numFreed:3, numWalked:6, Total: 0"});
+  EXPECT_EQ(PurgeLines(), Lines{"numFreed:3, numWalked:6, Total: 0"});
 }
 
 TEST_F(ReclaimTest, CheckedOutItemsAreWalkedButNeverFreed) {
-  auto items = Enter(3, {1});
+  auto items = EnterItems(3, {1});
   for (RK_Stuff* s : items) RK_TEST_Access::SetCheckoutCount(*s, 1);
   EXPECT_EQ(bag->FreeUpSomeMemory(1), RK_Bag::FreeUpResult_NothingFreed);
-  EXPECT_EQ(PurgeLines(), std::vector<std::string>{"numFreed:0, numWalked:6, Total: 3"});
-  for (RK_Stuff* s : items) {
-    EXPECT_TRUE(static_cast<TestStuff*>(s)->IsInMemory());
-    EXPECT_EQ(s->GetSortDir(), dir);
-  }
+  EXPECT_EQ(PurgeLines(), Lines{"numFreed:0, numWalked:6, Total: 3"});
   EXPECT_EQ(journal->Count("i1:FreeMemory"), 0);
-
-  // Dropping a checked-out item directly does nothing either.
+  // Dropping a checked-out item directly, or purging, does nothing either.
   items[0]->RemoveFromBagAndSortDir();
   EXPECT_EQ(items[0]->GetBag(), bag);
   bag->PurgeAllMemoryCaches();
-  EXPECT_EQ(rkhost::control::MemoryStat(), 1000300u);
+  EXPECT_EQ(Stat(), 1000300u);
+  for (RK_Stuff* s : items) EXPECT_EQ(s->GetSortDir(), dir);
   for (RK_Stuff* s : items) RK_TEST_Access::SetCheckoutCount(*s, 0);
 }
 
 TEST_F(ReclaimTest, NestedCallsFreeNothingAndFailuresOfTheStatisticPassThrough) {
-  Enter(2);
+  EnterItems(2);
   {
     RK_ScCacheLock lock;
     EXPECT_EQ(bag->FreeUpSomeMemory(0), RK_Bag::FreeUpResult_NothingFreed);
   }
-  EXPECT_EQ(bag->GetStuffCount(), 2u);
-  EXPECT_TRUE(PurgeLines().empty());
-
   rkhost::control::FailMemoryStat(42);
-  int thrown = 0;
-  try {
-    bag->FreeUpSomeMemory(0);
-  } catch (int code) {
-    thrown = code;
-  }
-  EXPECT_EQ(thrown, 42);
+  EXPECT_EQ(ThrownCode([&] { bag->FreeUpSomeMemory(0); }), 42);
   EXPECT_TRUE(PurgeLines().empty());
   EXPECT_EQ(bag->GetStuffCount(), 2u);
 }
 
 TEST_F(ReclaimTest, PurgeFreesEverythingAndKeepsOnlyDiskBackedItems) {
-  auto items = Enter(4, {2});
+  auto items = EnterItems(4, {2});
   const auto changes = dir->GetLastChangeTime();
   bag->PurgeAllMemoryCaches();
-  EXPECT_EQ(rkhost::control::MemoryStat(), 1000000u);
-  EXPECT_EQ(RK_TEST_Access::Order(*bag), std::vector<RK_Stuff*>{items[2]});
+  EXPECT_EQ(Stat(), 1000000u);
+  EXPECT_EQ(Order(), std::vector<RK_Stuff*>{items[2]});
   EXPECT_EQ(dir->GetStuffCount(), 1u);
-  // Four memory releases, three removals.
-  EXPECT_EQ(dir->GetLastChangeTime(), changes + 7);
+  EXPECT_EQ(dir->GetLastChangeTime(), changes + 7);  // four memory releases, three removals
   for (int i : {0, 1, 3}) EXPECT_EQ(journal->Count("i" + std::to_string(i) + ":destroyed"), 1);
 }
 
 TEST_F(ReclaimTest, FreeUpAsMuchAsPossibleReportsWhetherMemoryWasFreed) {
-  auto item = TestStuff::Make(100, true, true, journal, "x");
+  auto item = Make("x", 100, true, true);
   item->SetOnDisk(true);
-  item->AddToBagAndSortDir(bag, {});
+  Enter(item);
   const auto changes = dir->GetLastChangeTime();
-
   item->SetFreeMemoryRefuses(true);
   EXPECT_FALSE(RK_TEST_Access::FreeUpAsMuchAsPossible(*item));
   EXPECT_EQ(dir->GetLastChangeTime(), changes);

@@ -9,8 +9,7 @@
 #include <vector>
 
 #include "rkcache/rkcache.h"
-#include "support/test_access.h"
-#include "support/test_stuff.h"
+#include "support/module_fixture.h"
 
 namespace {
 
@@ -47,7 +46,7 @@ TEST(Registry, AbsentUntilTheFirstRegistration) {
   RK_Death();
 }
 
-TEST(Registry, LaterRegistrationReplacesAndNamesMatchExactly) {
+TEST(Registry, LaterRegistrationReplacesNamesMatchExactlyAndHeadersPassUnchanged) {
   RecordingFactory first{"first"};
   RecordingFactory second{"second"};
   RecordingFactory lower{"lower"};
@@ -55,10 +54,15 @@ TEST(Registry, LaterRegistrationReplacesAndNamesMatchExactly) {
   RK_Stuff::RegisterFactory("Frame", first);
   EXPECT_EQ(TagOf(Create("Frame")), "first");
   RK_Stuff::RegisterFactory("Frame", second);
-  EXPECT_EQ(TagOf(Create("Frame")), "second");
+  // Header bytes reach the factory unchanged.
+  RK_HeaderBytes bytes;
+  for (int i = 0; i < 300; ++i) bytes.push_back(static_cast<unsigned char>(i * 7));
+  bytes.push_back(0);
+  bytes.push_back(0xFF);
+  EXPECT_EQ(TagOf(Create("Frame", bytes)), "second");
   EXPECT_EQ(TagOf(Create("Frame")), "second");
   EXPECT_EQ(first.headers->size(), 1u);
-  EXPECT_EQ(second.headers->size(), 2u);
+  EXPECT_EQ(*second.headers, (std::vector<RK_HeaderBytes>{bytes, RK_HeaderBytes{}}));
 
   // Letter case and length matter.
   EXPECT_FALSE(Create("frame"));
@@ -69,23 +73,6 @@ TEST(Registry, LaterRegistrationReplacesAndNamesMatchExactly) {
   EXPECT_EQ(TagOf(Create("frame")), "lower");
   EXPECT_EQ(TagOf(Create("Frame")), "second");
   EXPECT_EQ(RK_TEST_Access::FactoryRegistry()->size(), 2u);
-
-  RK_Stuff::Death();
-}
-
-TEST(Registry, HeaderBytesReachTheFactoryUnchanged) {
-  RecordingFactory factory{"item"};
-  RK_Stuff::RegisterFactory("Frame", factory);
-
-  RK_HeaderBytes bytes;
-  for (int i = 0; i < 300; ++i) bytes.push_back(static_cast<unsigned char>(i * 7));
-  bytes.push_back(0);
-  bytes.push_back(0xFF);
-  ASSERT_TRUE(Create("Frame", bytes));
-  ASSERT_TRUE(Create("Frame", RK_HeaderBytes{}));
-  ASSERT_EQ(factory.headers->size(), 2u);
-  EXPECT_EQ((*factory.headers)[0], bytes);
-  EXPECT_TRUE((*factory.headers)[1].empty());
 
   RK_Stuff::Death();
 }
@@ -102,12 +89,7 @@ TEST(Registry, EmptyOrNullFactoriesYieldNullAndFactoryErrorsPassThrough) {
     throw 0x3A07;
   });
   EXPECT_THROW(Create("Rejects"), std::invalid_argument);
-  try {
-    Create("Rejects", RK_HeaderBytes{1});
-    ADD_FAILURE() << "nothing thrown";
-  } catch (int code) {
-    EXPECT_EQ(code, 0x3A07);
-  }
+  EXPECT_EQ(rktest::ThrownCode([] { Create("Rejects", RK_HeaderBytes{1}); }), 0x3A07);
 
   RK_Stuff::Death();
 }

@@ -46,7 +46,6 @@ class TestStuff : public RK_Stuff {
   // ---- Controls ----
   void SetInMemory(bool inMemory);                // adjusts the tracked bytes
   void SetOnDisk(std::optional<bool> onDisk);     // nullopt: the base answer (has a cache file)
-  void SetSize(std::uint32_t size) { size_.store(size); }
   void SetCanDiskCache(bool can) { canDiskCache_.store(can); }
   // Answers of IdenticalRequest / CanSatisfyRequest; default: true.
   void SetIdentical(std::function<bool(const RK_Stuff*)> f) { identical_ = std::move(f); }
@@ -57,7 +56,6 @@ class TestStuff : public RK_Stuff {
   void SetThrowFromIsInMemory(int code) { throwIsInMemory_.store(code); }
   const std::string& Name() const { return name_; }
   const std::shared_ptr<Journal>& GetJournal() const { return journal_; }
-  std::uint64_t TrackedBytes() const { return tracked_.load(); }
 
   // ---- RK_Stuff ----
   bool IdenticalRequest(const RK_Stuff* request) const override;

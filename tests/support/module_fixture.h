@@ -1,0 +1,73 @@
+// The fixture shared by the module's suites: the module is born on a main
+// thread with nothing captured, and dies after each test. Plus the helpers
+// most suites need.
+#pragma once
+
+#include <gtest/gtest.h>
+
+#include <boost/date_time/posix_time/posix_time.hpp>
+#include <memory>
+#include <string>
+#include <thread>
+#include <utility>
+#include <vector>
+
+#include "host/control.h"
+#include "rkcache/rkcache.h"
+#include "support/test_access.h"
+#include "support/test_stuff.h"
+
+namespace rktest {
+
+// Runs f, which must throw an int; returns it (or -1 if nothing was thrown).
+template <class F>
+int ThrownCode(F&& f) {
+  try {
+    f();
+  } catch (int code) {
+    return code;
+  }
+  return -1;
+}
+
+// (number, message) of every captured failed verification.
+std::vector<std::pair<int, std::string>> Verifications();
+// The detail texts of the captured error reports; each must carry the
+// module's group and the number 2.
+std::vector<std::string> ReportDetails();
+// Runs f on a new thread, marked as a render thread or not.
+template <class F>
+void OnThread(bool render, F&& f) {
+  std::thread([&] {
+    rkhost::control::SetCurrentThreadIsRenderThread(render);
+    f();
+  }).join();
+}
+
+class ModuleTest : public ::testing::Test {
+ protected:
+  void SetUp() override;
+  void TearDown() override;
+
+  // Enters item into the global bag and directory.
+  template <class T>
+  boost::intrusive_ptr<T> Enter(boost::intrusive_ptr<T> item,
+                                const boost::posix_time::time_duration& computeTime = {}) {
+    item->AddToBagAndSortDir(bag, computeTime);
+    return item;
+  }
+  // A journalled item of `size` bytes, named `name`.
+  TestStuffPtr Make(const std::string& name, std::uint32_t size = 1000, bool inMemory = true,
+                    bool track = false) const {
+    return TestStuff::Make(size, inMemory, track, journal, name);
+  }
+  std::vector<RK_Stuff*> Order() const { return RK_TEST_Access::Order(*bag); }
+  std::vector<RK_Stuff*> Group(const RK_Stuff& key) const { return RK_TEST_Access::Group(*dir, key); }
+  bool Indexed(const RK_Stuff& item) const;
+
+  boost::shared_ptr<RK_Bag> bag;
+  boost::shared_ptr<RK_SortDir> dir;
+  std::shared_ptr<Journal> journal = std::make_shared<Journal>();
+};
+
+}  // namespace rktest
