@@ -89,24 +89,32 @@ void BM_AddToBagAndSortDir(benchmark::State& state) {
 BENCHMARK(BM_AddToBagAndSortDir)->Arg(10000)->Iterations(200)->Unit(benchmark::kMicrosecond);
 BENCHMARK(BM_AddToBagAndSortDir)->Arg(1000000)->Iterations(50)->Unit(benchmark::kMicrosecond);
 
-// Freeing a thousand items' worth out of range(0) items that live in memory
-// only: pass 1 (disk-backed memory) finds nothing and walks the whole bag,
-// pass 2 drops the oldest thousand. The thousand are replaced (untimed).
-void BM_FreeUpSomeMemory_MemoryOnly(benchmark::State& state) {
-  const auto cacheSize = static_cast<std::size_t>(state.range(0));
-  constexpr std::size_t kFreed = 1000;
-  Fill(cacheSize, false);
+// How many items' worth each FreeUpSomeMemory call is asked to free.
+constexpr std::size_t kFreed = 1000;
+
+// Times FreeUpSomeMemory on the global bag, asked for kFreed items' worth;
+// `refill` puts back (untimed) what a call freed.
+template <class Refill>
+void TimeFreeing(benchmark::State& state, Refill refill) {
   const auto bag = RK_GlobalBag();
   for (auto _ : state) {
     const auto result = bag->FreeUpSomeMemory(kFreed * kItemBytes - 1);
     benchmark::DoNotOptimize(result);
     state.PauseTiming();
     if (result != RK_Bag::FreeUpResult_FreedEnough) state.SkipWithError("did not free enough");
-    Fill(kFreed, false);
+    refill();
     rkhost::control::ClearCaptured();
     state.ResumeTiming();
   }
   state.SetItemsProcessed(static_cast<std::int64_t>(state.iterations() * kFreed));
+}
+
+// Freeing a thousand items' worth out of range(0) items that live in memory
+// only: pass 1 (disk-backed memory) finds nothing and walks the whole bag,
+// pass 2 drops the oldest thousand. The thousand are replaced (untimed).
+void BM_FreeUpSomeMemory_MemoryOnly(benchmark::State& state) {
+  Fill(static_cast<std::size_t>(state.range(0)), false);
+  TimeFreeing(state, [] { Fill(kFreed, false); });
   Empty();
 }
 BENCHMARK(BM_FreeUpSomeMemory_MemoryOnly)->Arg(10000)->Iterations(200)->Unit(benchmark::kMicrosecond);
@@ -115,21 +123,11 @@ BENCHMARK(BM_FreeUpSomeMemory_MemoryOnly)->Arg(1000000)->Iterations(8)->Unit(ben
 // The same when every item is also on disk: pass 1 frees the oldest
 // thousand and stops. Their memory comes back (untimed) for the next round.
 void BM_FreeUpSomeMemory_DiskBacked(benchmark::State& state) {
-  const auto cacheSize = static_cast<std::size_t>(state.range(0));
-  constexpr std::size_t kFreed = 1000;
-  std::vector<BenchPtr> items = MakeItems(cacheSize, true);
+  std::vector<BenchPtr> items = MakeItems(static_cast<std::size_t>(state.range(0)), true);
   Enter(items);
-  const auto bag = RK_GlobalBag();
-  for (auto _ : state) {
-    const auto result = bag->FreeUpSomeMemory(kFreed * kItemBytes - 1);
-    benchmark::DoNotOptimize(result);
-    state.PauseTiming();
-    if (result != RK_Bag::FreeUpResult_FreedEnough) state.SkipWithError("did not free enough");
+  TimeFreeing(state, [&items] {
     for (std::size_t i = 0; i < kFreed; ++i) items[i]->SetInMemory(true);
-    rkhost::control::ClearCaptured();
-    state.ResumeTiming();
-  }
-  state.SetItemsProcessed(static_cast<std::int64_t>(state.iterations() * kFreed));
+  });
   items.clear();
   Empty();
 }
