@@ -1,10 +1,5 @@
 // Receipts: checking in on reuse and destruction, release, swap, errors in
 // the destructor, the was-on-disk flag, and copies sharing one check-out.
-#include <string>
-#include <thread>
-#include <utility>
-#include <vector>
-
 #include "support/file_stuff.h"
 #include "support/module_fixture.h"
 
@@ -23,10 +18,8 @@ TEST_F(ReceiptTest, ChecksInOnReuseAndDestructionButNotAfterAFailedCheckout) {
   TestStuffPtr b = Enter(TestStuff::Make());
   {
     RK_ScCheckout empty;
-    EXPECT_FALSE(empty.DidCheckout());
+    EXPECT_FALSE(empty.DidCheckout() || empty.IsOnDisk() || empty.GetStuff());
     EXPECT_EQ(empty.GetResult(), RK_CheckoutResult_NotCheckedOut);
-    EXPECT_EQ(empty.GetStuff(), nullptr);
-    EXPECT_FALSE(empty.IsOnDisk());
   }
   {
     RK_ScCheckout receipt(a.get(), kReadOnly);
@@ -42,7 +35,6 @@ TEST_F(ReceiptTest, ChecksInOnReuseAndDestructionButNotAfterAFailedCheckout) {
     // A lookup through the global directory, after checking b in.
     EXPECT_EQ(receipt.FindAndCheckout(a.get(), kReadOnly), RK_CheckoutResult_CheckedOut);
     EXPECT_EQ(b->GetCheckoutCount(), 0u);
-    EXPECT_EQ(a->GetCheckoutCount(), 1u);
     EXPECT_EQ(receipt.GetStuff(), a.get());
   }
   EXPECT_EQ(a->GetCheckoutCount(), 0u);
@@ -63,8 +55,7 @@ TEST_F(ReceiptTest, ChecksInOnReuseAndDestructionButNotAfterAFailedCheckout) {
   // Checkin passes its flags and empties the receipt; a second does nothing.
   RK_ScCheckout receipt(a.get(), kReadOnly);
   receipt.Checkin(RK_Checkin_Discard, {});
-  EXPECT_FALSE(receipt.DidCheckout());
-  EXPECT_EQ(receipt.GetStuff(), nullptr);
+  EXPECT_FALSE(receipt.DidCheckout() || receipt.GetStuff());
   EXPECT_FALSE(a->GetBag());
   receipt.Checkin(0, {});
   EXPECT_EQ(a->GetCheckoutCount(), 0u);
@@ -96,8 +87,7 @@ TEST_F(ReceiptTest, ReleaseHandsTheCheckoutOverAndSwapAndMoveTransferIt) {
     RK_ScCheckout empty;
     empty.Swap(holder);
     EXPECT_TRUE(empty.DidCheckout());
-    EXPECT_FALSE(holder.DidCheckout());
-    EXPECT_EQ(holder.GetStuff(), nullptr);
+    EXPECT_FALSE(holder.DidCheckout() || holder.GetStuff());
   }
   EXPECT_EQ(a->GetCheckoutCount(), 0u);  // checked in once, by the new holder
 
@@ -121,8 +111,7 @@ TEST_F(ReceiptTest, CopiesShareOneCheckoutAndCheckItInOnce) {
     {
       RK_ScCheckout copy(original);
       RK_ScCheckout another = copy;
-      EXPECT_TRUE(another.DidCheckout());
-      EXPECT_EQ(copy.GetStuff(), a.get());
+      EXPECT_TRUE(another.DidCheckout() && another.GetStuff() == a.get());
       EXPECT_EQ(a->GetCheckoutCount(), 1u);
       EXPECT_EQ(a->RefCountForDiagnostics(), 5u);  // each copy keeps the item alive
     }
@@ -132,8 +121,7 @@ TEST_F(ReceiptTest, CopiesShareOneCheckoutAndCheckItInOnce) {
   EXPECT_EQ(a->GetCheckoutCount(), 0u);
   EXPECT_EQ(a->RefCountForDiagnostics(), 2u);
 
-  // Check-in through one copy only lets go of its share; the last one to
-  // let go checks in, with its own flags.
+  // Check-in through one copy lets go of its share; the last checks in with its flags.
   {
     RK_ScCheckout original(a.get(), kReadOnly);
     RK_ScCheckout copy(original);
@@ -219,8 +207,7 @@ TEST_F(ReceiptTest, ConflictsLeaveTheReceiptEmptyAndTheDestructorSwallowsCheckin
   TestStuffPtr a = Enter(TestStuff::Make());
   RK_ScCheckout writer(a.get(), 0);
   EXPECT_EQ(ThrownCode([&] { RK_ScCheckout reader(a.get(), kReadOnly); }), 0x3A03);
-  // A writeable lookup whose match is held: the conflict leaves the
-  // receipt empty, and what it held before was checked in first.
+  // A conflict in a lookup empties the receipt, which checked in what it held first.
   TestStuffPtr b = Enter(TestStuff::Make());
   RK_ScCheckout holdsB(b.get(), kReadOnly);
   RK_ScCheckout reader(b.get(), kReadOnly);
@@ -232,8 +219,7 @@ TEST_F(ReceiptTest, ConflictsLeaveTheReceiptEmptyAndTheDestructorSwallowsCheckin
                                                                "cannot check-out read/write already checked-out item"}));
   writer.Release()->Checkin(0, {});
 
-  // The check-out is ended behind the receipt's back, so its destructor's
-  // check-in fails: on a render thread, with no report and nothing thrown.
+  // Ended behind the receipt's back, its destructor's check-in fails quietly.
   rkhost::control::ClearCaptured();
   rktest::OnThread(true, [&] {
     RK_ScCheckout held(a.get(), kReadOnly);

@@ -2,8 +2,6 @@
 // counting, and the check-out state checks.
 #include <atomic>
 #include <set>
-#include <thread>
-#include <vector>
 
 #include "support/module_fixture.h"
 
@@ -22,8 +20,8 @@ class BareStuff : public RK_Stuff {
   ~BareStuff() override = default;
 };
 
-// Counts its destructions; its destructor takes and drops a temporary
-// reference to itself, as subclasses that notify observers do.
+// Counts its deaths; its destructor takes a temporary reference to itself,
+// as subclasses that notify observers do.
 class CountedStuff : public BareStuff {
  public:
   explicit CountedStuff(std::atomic<int>* deaths) : deaths_(deaths) {}
@@ -45,10 +43,7 @@ TEST(Stuff, NewItemHasItsInitialStateAndItsOwnGuid) {
   boost::intrusive_ptr<RK_Stuff> item(new BareStuff);
   EXPECT_EQ(item->GetCheckoutCount(), 0u);
   EXPECT_FALSE(item->IsCheckedOutWriteable());
-  EXPECT_FALSE(item->IsOnDisk());
-  EXPECT_FALSE(item->GetBag());
-  EXPECT_FALSE(item->GetSortDir());
-  EXPECT_FALSE(item->GetNoDiskCache());
+  EXPECT_FALSE(item->IsOnDisk() || item->GetBag() || item->GetSortDir() || item->GetNoDiskCache());
   EXPECT_LE(before, item->GetLastUseTime());
   EXPECT_LE(item->GetLastUseTime(), RK_Now());
   EXPECT_EQ(item->RefCountForDiagnostics(), 1u);
@@ -115,21 +110,24 @@ TEST(Stuff, LastReleaseDeletesExactlyOnce) {
 TEST(Stuff, CheckoutChecksCompareUnsigned) {
   rkhost::control::MakeCurrentThreadMain();
   boost::intrusive_ptr<RK_Stuff> item(new BareStuff);
-  const auto lessThan = [&](int n) { return ThrownCode([&] { RK_TEST_Access::ThrowIfCheckedOutLessThan(*item, n); }); };
-  const auto moreThan = [&](int n) { return ThrownCode([&] { RK_TEST_Access::ThrowIfCheckedOutMoreThan(*item, n); }); };
-  EXPECT_EQ(lessThan(1), 0x3A04);
-  EXPECT_EQ(lessThan(0), -1);
-  RK_TEST_Access::SetCheckoutCount(*item, 3);
-  EXPECT_EQ(lessThan(3), -1);
-  EXPECT_EQ(lessThan(4), 0x3A04);
-  EXPECT_EQ(lessThan(-1), 0x3A04);  // -1 compares as the largest count
-
-  RK_TEST_Access::SetCheckoutCount(*item, 1);
-  EXPECT_EQ(moreThan(0), 0x3A03);
-  EXPECT_EQ(moreThan(1), -1);
-  RK_TEST_Access::SetCheckoutCount(*item, 0xFFFFFFFFu);
-  EXPECT_EQ(moreThan(-1), -1);
-
+  const struct {
+    std::uint32_t count;
+    bool lessThan;  // else moreThan
+    int n, code;
+  } cases[] = {
+      {0, true, 1, 0x3A04},          {0, true, 0, -1},  {3, true, 3, -1}, {3, true, 4, 0x3A04},
+      {3, true, -1, 0x3A04},  // -1 compares as the largest count
+      {1, false, 0, 0x3A03},         {1, false, 1, -1}, {0xFFFFFFFFu, false, -1, -1},
+  };
+  for (const auto& c : cases) {
+    RK_TEST_Access::SetCheckoutCount(*item, c.count);
+    EXPECT_EQ(ThrownCode([&] {
+                c.lessThan ? RK_TEST_Access::ThrowIfCheckedOutLessThan(*item, c.n)
+                           : RK_TEST_Access::ThrowIfCheckedOutMoreThan(*item, c.n);
+              }),
+              c.code)
+        << "count " << c.count << (c.lessThan ? " < " : " > ") << c.n;
+  }
   RK_TEST_Access::SetCheckoutCount(*item, 1);
   rkhost::control::ClearCaptured();
   EXPECT_EQ(ThrownCode([&] { RK_TEST_Access::ThrowIfCheckedOutWriteable(*item); }), -1);

@@ -1,9 +1,11 @@
 #include "support/module_fixture.h"
 
+#include <algorithm>
+
 namespace rktest {
 
-std::vector<std::pair<int, std::string>> Verifications() {
-  std::vector<std::pair<int, std::string>> out;
+std::vector<Verification> Verifications() {
+  std::vector<Verification> out;
   for (const auto& v : rkhost::control::Snapshot().verifications) out.emplace_back(v.number, v.message);
   return out;
 }
@@ -34,9 +36,8 @@ void ModuleTest::TearDown() {
 }
 
 bool ModuleTest::Indexed(const RK_Stuff& item) const {
-  for (RK_Stuff* s : Group(item))
-    if (s == &item) return true;
-  return false;
+  const auto group = Group(item);
+  return std::find(group.begin(), group.end(), &item) != group.end();
 }
 
 }  // namespace rktest

@@ -1,6 +1,5 @@
 // The fixture shared by the module's suites: the module is born on a main
-// thread with nothing captured, and dies after each test. Plus the helpers
-// most suites need.
+// thread with nothing captured and dies after each test; plus common helpers.
 #pragma once
 
 #include <gtest/gtest.h>
@@ -19,7 +18,7 @@
 
 namespace rktest {
 
-// Runs f, which must throw an int; returns it (or -1 if nothing was thrown).
+// The int f throws, or -1 if it throws nothing.
 template <class F>
 int ThrownCode(F&& f) {
   try {
@@ -30,8 +29,8 @@ int ThrownCode(F&& f) {
   return -1;
 }
 
-// (number, message) of every captured failed verification.
-std::vector<std::pair<int, std::string>> Verifications();
+using Verification = std::pair<int, std::string>;
+std::vector<Verification> Verifications();
 // The detail texts of the captured error reports; each must carry the
 // module's group and the number 2.
 std::vector<std::string> ReportDetails();
@@ -49,14 +48,12 @@ class ModuleTest : public ::testing::Test {
   void SetUp() override;
   void TearDown() override;
 
-  // Enters item into the global bag and directory.
   template <class T>
   boost::intrusive_ptr<T> Enter(boost::intrusive_ptr<T> item,
                                 const boost::posix_time::time_duration& computeTime = {}) {
     item->AddToBagAndSortDir(bag, computeTime);
     return item;
   }
-  // A journalled item of `size` bytes, named `name`.
   TestStuffPtr Make(const std::string& name, std::uint32_t size = 1000, bool inMemory = true,
                     bool track = false) const {
     return TestStuff::Make(size, inMemory, track, journal, name);

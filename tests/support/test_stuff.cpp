@@ -26,11 +26,7 @@ void Journal::Clear() {
 
 TestStuff::TestStuff(std::uint32_t size, bool inMemory, bool trackMemory, std::shared_ptr<Journal> journal,
                      std::string name)
-    : name_(std::move(name)),
-      journal_(std::move(journal)),
-      size_(size),
-      inMemory_(false),
-      trackMemory_(trackMemory) {
+    : name_(std::move(name)), journal_(std::move(journal)), size_(size), inMemory_(false), trackMemory_(trackMemory) {
   SetInMemory(inMemory);
 }
 

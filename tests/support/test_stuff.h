@@ -1,6 +1,5 @@
-// A test item: its size, memory and disk state and its answers to requests
-// are set by the test, and it records what it was asked (and its death) in a
-// journal that outlives it.
+// A test item whose state and answers the test sets; it records what it was
+// asked (and its death) in a journal that outlives it.
 #pragma once
 
 #include <atomic>
@@ -16,12 +15,11 @@
 
 namespace rktest {
 
-// What was done to one or more test items, in order. Thread-safe.
+// Events done to test items, in order. Thread-safe.
 class Journal {
  public:
   void Add(const std::string& event);
   std::vector<std::string> Events() const;
-  // How many events equal `event`.
   int Count(const std::string& event) const;
   void Clear();
 
@@ -32,32 +30,26 @@ class Journal {
 
 class TestStuff : public RK_Stuff {
  public:
-  // An item of `size` bytes, in memory unless told otherwise. When
-  // trackMemory is true, the item's bytes count in host memory statistic 6
-  // while it is in memory, so freeing it lowers the statistic.
+  // With trackMemory, the item's bytes count in host memory statistic 6
+  // while it is in memory.
   explicit TestStuff(std::uint32_t size = 1000, bool inMemory = true, bool trackMemory = false,
                      std::shared_ptr<Journal> journal = nullptr, std::string name = "item");
-
   static boost::intrusive_ptr<TestStuff> Make(std::uint32_t size = 1000, bool inMemory = true,
                                               bool trackMemory = false,
                                               std::shared_ptr<Journal> journal = nullptr,
                                               std::string name = "item");
 
-  // ---- Controls ----
-  void SetInMemory(bool inMemory);                // adjusts the tracked bytes
-  void SetOnDisk(std::optional<bool> onDisk);     // nullopt: the base answer (has a cache file)
+  void SetInMemory(bool inMemory);             // adjusts the tracked bytes
+  void SetOnDisk(std::optional<bool> onDisk);  // nullopt: the base answer
   void SetCanDiskCache(bool can) { canDiskCache_.store(can); }
-  // Answers of IdenticalRequest / CanSatisfyRequest; default: true.
+  // Answers of IdenticalRequest / CanSatisfyRequest; default: the base's.
   void SetIdentical(std::function<bool(const RK_Stuff*)> f) { identical_ = std::move(f); }
   void SetCanSatisfy(std::function<bool(const RK_Stuff*)> f) { canSatisfy_ = std::move(f); }
-  // FreeMemory frees (and returns true) unless told to refuse.
   void SetFreeMemoryRefuses(bool refuses) { freeRefuses_.store(refuses); }
-  // Makes the next calls of a virtual throw `code` (0: no throw).
-  void SetThrowFromIsInMemory(int code) { throwIsInMemory_.store(code); }
+  void SetThrowFromIsInMemory(int code) { throwIsInMemory_.store(code); }  // 0: no throw
   const std::string& Name() const { return name_; }
   const std::shared_ptr<Journal>& GetJournal() const { return journal_; }
 
-  // ---- RK_Stuff ----
   bool IdenticalRequest(const RK_Stuff* request) const override;
   bool CanSatisfyRequest(const RK_Stuff* request) const override;
   std::uint32_t GetSizeInBytes() override;
