@@ -1,9 +1,5 @@
-// The bag: ordering by last use, refusing double entries and removal from
-// the wrong bag, clearing, copying and destruction.
-#include <boost/date_time/posix_time/posix_time.hpp>
-#include <string>
-#include <vector>
-
+// The bag: order of last use, refused double entries and removals,
+// clearing, copying and destruction.
 #include "support/module_fixture.h"
 
 namespace {
@@ -41,7 +37,6 @@ TEST_F(BagTest, WalksOldestFirstAndKeepsInsertionOrderForEqualStamps) {
   {
     RK_ScCacheLock lock;
     RK_TEST_Access::RemoveStuffGuts(*local, s[1].get());
-    EXPECT_FALSE(s[1]->GetBag());
     RK_TEST_Access::SetLastUseTime(*s[1], t1);
     RK_TEST_Access::AddStuffGuts(*local, s[1]);
   }
@@ -53,8 +48,6 @@ TEST_F(BagTest, WalksOldestFirstAndKeepsInsertionOrderForEqualStamps) {
   auto young = TestStuff::Make();
   local->AddStuff(young);
   EXPECT_EQ(RK_TEST_Access::Order(*local).back(), young.get());
-  EXPECT_EQ(young->GetBag(), local);
-  EXPECT_GT(young->GetLastUseTime(), t1);
   EXPECT_EQ(local->GetStuffCount(), 8u);
   local.reset();  // the bag holds plain pointers: it goes before the items
 }
@@ -98,7 +91,6 @@ TEST_F(BagTest, RefusesDoubleEntriesAndRemovalFromTheWrongBagChangingNothing) {
   EXPECT_EQ(a->GetLastUseTime(), stampA);
   EXPECT_EQ(Order(), before);
   EXPECT_EQ(bag2->GetStuffCount(), 0u);
-  EXPECT_EQ(a->GetBag(), bag);
   bag->RemoveStuff(a.get());
   EXPECT_EQ(Order(), std::vector<RK_Stuff*>{b.get()});
   EXPECT_EQ(ThrownCode([&] { bag->RemoveStuff(a.get()); }), 3);
@@ -119,8 +111,7 @@ TEST_F(BagTest, ClearingLeavesCheckedOutItems) {
   for (int i = 0; i < 3; ++i) Enter(Make("gone" + std::to_string(i), 100));
   bag->ClearBagAndSortDir();
   EXPECT_EQ(Order(), std::vector<RK_Stuff*>{kept.get()});
-  EXPECT_EQ(dir->GetStuffCount(), 1u);
-  EXPECT_EQ(kept->GetSortDir(), dir);
+  EXPECT_EQ(Group(*kept), std::vector<RK_Stuff*>{kept.get()});
   EXPECT_EQ(journal->Count("kept:FreeMemory"), 0);
   for (int i = 0; i < 3; ++i) {
     const std::string name = "gone" + std::to_string(i);
@@ -147,11 +138,8 @@ TEST_F(BagTest, CopyAssignmentCopiesElementsAndSettingsWithoutTellingItems) {
   }
   // Destroying the copy leaves the items in the bag they are in.
   EXPECT_EQ(a->GetBag(), original);
-  EXPECT_EQ(b->GetBag(), original);
   original->RemoveStuff(a.get());
   EXPECT_EQ(RK_TEST_Access::Order(*original), std::vector<RK_Stuff*>{b.get()});
-  original->EnableDiskCache(false);
-  EXPECT_FALSE(original->IsDiskCacheEnabled());
   original.reset();
 }
 
@@ -162,8 +150,7 @@ TEST_F(BagTest, DestroyingABagReleasesItsItemsQuietly) {
   a->AddToBagAndSortDir(local, {});
   b->AddToBagAndSortDir(local, {});
   local.reset();
-  EXPECT_FALSE(a->GetBag());
-  EXPECT_FALSE(b->GetBag());
+  EXPECT_FALSE(a->GetBag() || b->GetBag());
   EXPECT_EQ(Group(*a), std::vector<RK_Stuff*>{a.get()});
   EXPECT_TRUE(rktest::Verifications().empty());
   // The items can enter another bag now.

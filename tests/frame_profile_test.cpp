@@ -58,38 +58,32 @@ TEST(FrameProfile, ScopesRecordAtOrAboveTheirVolumeIntoOneLogEach) {
   OpenEveryScope();
   EXPECT_TRUE(LogsByName().empty());
 
+  // Each scope at or below the volume has one log of its own volume with
+  // `count(scope)` intervals; the others have none.
+  const auto check = [](int volume, auto count) {
+    auto logs = LogsByName();
+    for (const Scope& scope : kScopes) {
+      SCOPED_TRACE(scope.name);
+      ASSERT_EQ(logs.count(scope.name), scope.volume <= volume ? 1u : 0u);
+      if (scope.volume > volume) continue;
+      EXPECT_EQ(logs[scope.name].logs, 1);
+      EXPECT_EQ(logs[scope.name].count, count(scope));
+      EXPECT_EQ(logs[scope.name].volume, scope.volume);
+    }
+  };
   manager.SetProfilingVolume(6);
   OpenEveryScope();
-  auto logs = LogsByName();
-  for (const Scope& scope : kScopes) {
-    SCOPED_TRACE(scope.name);
-    if (scope.volume <= 6) {
-      ASSERT_EQ(logs.count(scope.name), 1u);
-      EXPECT_EQ(logs[scope.name].logs, 1);
-      EXPECT_EQ(logs[scope.name].count, 1u);
-      EXPECT_EQ(logs[scope.name].volume, scope.volume);
-    } else {
-      EXPECT_EQ(logs.count(scope.name), 0u);
-    }
-  }
-
+  check(6, [](const Scope&) { return 1u; });
   // At 9 all eight record; the logs made at 6 are reused, not made again.
   manager.SetProfilingVolume(9);
   OpenEveryScope();
   OpenEveryScope();
-  logs = LogsByName();
-  for (const Scope& scope : kScopes) {
-    SCOPED_TRACE(scope.name);
-    ASSERT_EQ(logs.count(scope.name), 1u);
-    EXPECT_EQ(logs[scope.name].logs, 1);
-    EXPECT_EQ(logs[scope.name].count, scope.volume <= 6 ? 3u : 2u);
-    EXPECT_EQ(logs[scope.name].volume, scope.volume);
-  }
+  check(9, [](const Scope& scope) { return scope.volume <= 6 ? 3u : 2u; });
 
   // Switched off again: the logs stay but record nothing more.
   manager.SetConditionalProfiling(false);
   OpenEveryScope();
-  logs = LogsByName();
+  auto logs = LogsByName();
   EXPECT_EQ(logs["VX.RK_Bag::GetCacheSizesInBytes"].count, 2u);
   EXPECT_EQ(logs["VX.render.RK_Stuff::Checkout"].count, 3u);
 

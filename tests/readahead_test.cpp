@@ -6,7 +6,6 @@
 #include <chrono>
 #include <future>
 #include <stdexcept>
-#include <string>
 #include <thread>
 #include <vector>
 
@@ -51,10 +50,8 @@ class ReadAhead : public ::testing::Test {
 TEST_F(ReadAhead, FlagCountsOnlyOnRenderThreadsAndEverySwitchResetsTheSkipInterval) {
   EXPECT_EQ(ReadAheadInfo::Get(), info_);
   EXPECT_FALSE(OnRenderThread([&] { return info_->DoReadAhead(); }));
-  EXPECT_EQ(info_->GetReadAheadSkipInterval(), 1);
   info_->SetReadAheadSkipInterval(4);
   EXPECT_EQ(info_->GetReadAheadSkipInterval(), 4);
-
   info_->SetDoReadAhead(true);
   EXPECT_EQ(info_->GetReadAheadSkipInterval(), 1);
   EXPECT_TRUE(OnRenderThread([&] { return info_->DoReadAhead(); }));
