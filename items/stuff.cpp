@@ -11,6 +11,7 @@
 #include "rkcache/stuff.h"
 
 #include "frame/report.h"
+#include "rkcache/bag.h"
 #include "rkcache/errors.h"
 #include "rkcache/lifecycle.h"
 #include "rkcache/sortdir.h"
@@ -23,11 +24,21 @@ void RK_Stuff::SetGuid(const plinth::utility::Guid& g) {
   guidHash = RK_GuidHash::Of(g);
 }
 
-// Only the last release gets here, and the bag and sort directory each hold
-// a reference while they index the item, so neither can still name it. The
-// weak links and the cache file reference go with the members; the cache
-// file itself stays on disk.
-RK_Stuff::~RK_Stuff() = default;
+// Only the last release gets here. The sort directory holds a reference while
+// it indexes the item, so it cannot still name it; but a bag holds plain
+// pointers, and an item a host put into a bag directly (RK_Bag::AddStuff,
+// without a directory) may die while the bag still lists it. It leaves the
+// bag here, so the bag never names a dead item. Items that left their bag
+// before (the usual case) take no lock. The cache file stays on disk.
+RK_Stuff::~RK_Stuff() {
+  if (bag.expired()) return;
+  try {
+    RK_ScCacheLock lock;
+    if (const boost::shared_ptr<RK_Bag> owner = bag.lock()) owner->RemoveStuffGuts(this);
+  } catch (...) {
+    // Cannot happen (the link names the bag); a destructor must not throw.
+  }
+}
 
 bool RK_Stuff::IdenticalRequest(const RK_Stuff*) const {
   return true;

@@ -143,6 +143,18 @@ TEST_F(BagTest, CopyAssignmentCopiesElementsAndSettingsWithoutTellingItems) {
   original.reset();
 }
 
+TEST_F(BagTest, AnItemThatDiesWhileInABagLeavesIt) {
+  auto first = TestStuff::Make();
+  auto second = TestStuff::Make();
+  bag->AddStuff(first);
+  bag->AddStuff(second);
+  first.reset();  // no directory held it: this was the last reference
+  EXPECT_EQ(Order(), std::vector<RK_Stuff*>{second.get()});
+  EXPECT_TRUE(rktest::Verifications().empty());
+  second.reset();
+  EXPECT_EQ(bag->GetStuffCount(), 0u);
+}
+
 TEST_F(BagTest, DestroyingABagReleasesItsItemsQuietly) {
   auto local = NewBag();
   auto a = TestStuff::Make();
