@@ -7,10 +7,10 @@
 #pragma once
 
 #include <atomic>
-#include <cstdint>
 #include <boost/shared_ptr.hpp>
-#include <boost/weak_ptr.hpp>
 #include <boost/thread/recursive_mutex.hpp>
+#include <boost/weak_ptr.hpp>
+#include <cstdint>
 
 #include "plinth/threads.h"
 #include "rkcache/bag.h"

@@ -81,7 +81,8 @@ void RK_Bag::AddStuffGuts(boost::intrusive_ptr<RK_Stuff> stuff) {
 }
 
 boost::posix_time::ptime RK_Bag::StampFor(const boost::posix_time::ptime& now) const {
-  if (!stuffByLastUse.empty() && stuffByLastUse.back()->lastUseTime > now) return stuffByLastUse.back()->lastUseTime;
+  if (!stuffByLastUse.empty() && stuffByLastUse.back()->lastUseTime > now)
+    return stuffByLastUse.back()->lastUseTime;
   return now;
 }
 

@@ -6,9 +6,9 @@ namespace {
 
 using boost::posix_time::milliseconds;
 using boost::posix_time::ptime;
-using rktest::ThrownCode;
 using rktest::TestStuff;
 using rktest::TestStuffPtr;
+using rktest::ThrownCode;
 
 class BagTest : public rktest::ModuleTest {
  protected:
@@ -97,7 +97,8 @@ TEST_F(BagTest, RefusesDoubleEntriesAndRemovalFromTheWrongBagChangingNothing) {
 
   const std::pair<int, std::string> twice{380, "stuff already in a bag"};
   const std::pair<int, std::string> wrong{402, "stuff not in the right bag"};
-  EXPECT_EQ(rktest::Verifications(), (std::vector<std::pair<int, std::string>>{twice, twice, twice, wrong, wrong, wrong}));
+  EXPECT_EQ(rktest::Verifications(),
+            (std::vector<std::pair<int, std::string>>{twice, twice, twice, wrong, wrong, wrong}));
   EXPECT_TRUE(rkhost::control::Snapshot().errorReports.empty());
 }
 

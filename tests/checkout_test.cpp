@@ -16,9 +16,9 @@ namespace {
 
 using boost::posix_time::time_duration;
 using rktest::FileStuff;
-using rktest::ThrownCode;
 using rktest::TestStuff;
 using rktest::TestStuffPtr;
+using rktest::ThrownCode;
 
 constexpr int kReadOnly = RK_Checkout_ReadOnly;
 constexpr int kWriteable = 0;

@@ -69,7 +69,8 @@ TEST(FrameErrors, MessageTableHoldsTheStoredTextsAndTheTerminator) {
     EXPECT_EQ(raw.substr(0, stored.size()), stored);
     EXPECT_EQ(raw.substr(stored.size(), marker.size()), i < 21 ? std::string() : marker);
     EXPECT_GE(raw.size(), stored.size() + (i < 21 ? 0 : marker.size() + 1));  // a note follows the marker
-    EXPECT_EQ((std::vector<std::intptr_t>{entry.slots[0], entry.slots[1], entry.slots[2]}), (std::vector<std::intptr_t>{0, 0, 0}));
+    EXPECT_EQ((std::vector<std::intptr_t>{entry.slots[0], entry.slots[1], entry.slots[2]}),
+              (std::vector<std::intptr_t>{0, 0, 0}));
   }
   const HK_LStrEntry& terminator = RK_G_zref->entries[27];
   EXPECT_EQ(terminator.keyAndText, nullptr);

@@ -28,7 +28,9 @@ const std::string kBirthLine = "10|Birth|RK Birth";
 const std::string kStopLine = "10|RK_StopAllAsyncWork|RK_StopAllAsyncWork";
 const std::string kDeathLine = "10|Death|RK Death";
 
-std::uint32_t Holds(const boost::shared_ptr<RK_Bag>& bag) { return RK_TEST_Access::LockHoldCount(*bag); }
+std::uint32_t Holds(const boost::shared_ptr<RK_Bag>& bag) {
+  return RK_TEST_Access::LockHoldCount(*bag);
+}
 
 }  // namespace
 

@@ -5,9 +5,9 @@
 
 namespace {
 
-using rktest::ThrownCode;
 using rktest::TestStuff;
 using rktest::TestStuffPtr;
+using rktest::ThrownCode;
 
 constexpr int kReadOnly = RK_Checkout_ReadOnly;
 
@@ -215,8 +215,9 @@ TEST_F(ReceiptTest, ConflictsLeaveTheReceiptEmptyAndTheDestructorSwallowsCheckin
   EXPECT_FALSE(reader.DidCheckout());
   EXPECT_EQ(b->GetCheckoutCount(), 1u);
   EXPECT_EQ(a->GetCheckoutCount(), 1u);
-  EXPECT_EQ(rktest::ReportDetails(), (std::vector<std::string>{"cached item already checked-out read/write",
-                                                               "cannot check-out read/write already checked-out item"}));
+  EXPECT_EQ(rktest::ReportDetails(),
+            (std::vector<std::string>{"cached item already checked-out read/write",
+                                      "cannot check-out read/write already checked-out item"}));
   writer.Release()->Checkin(0, {});
 
   // Ended behind the receipt's back, its destructor's check-in fails quietly.

@@ -6,8 +6,8 @@
 namespace {
 
 using boost::posix_time::milliseconds;
-using rktest::ThrownCode;
 using rktest::TestStuffPtr;
+using rktest::ThrownCode;
 
 const auto kNever = [](const RK_Stuff*) { return false; };
 
@@ -143,9 +143,9 @@ TEST_F(SortDirTest, RemovalChecksAndChangeCount) {
   dir->RemoveStuff(a.get());
   EXPECT_EQ(dir->GetLastChangeTime(), changes + 2);
   EXPECT_FALSE(a->GetSortDir());
-  EXPECT_EQ(rktest::Verifications(), (std::vector<std::pair<int, std::string>>{
-                                         {1382, "can't remove a writeable stuff from sortdir"},
-                                         {1381, "stuff not in the right sortdir"}}));
+  EXPECT_EQ(rktest::Verifications(),
+            (std::vector<std::pair<int, std::string>>{{1382, "can't remove a writeable stuff from sortdir"},
+                                                      {1381, "stuff not in the right sortdir"}}));
 }
 
 TEST_F(SortDirTest, DestroyingADirectoryReleasesItsItemsQuietly) {

@@ -72,7 +72,8 @@ TEST(Stuff, BaseClassAnswers) {
   item->GetHeader(header);
   EXPECT_EQ(header, (RK_HeaderBytes{1, 2, 3}));
   // On disk exactly while it has a cache file.
-  RK_TEST_Access::SetDiskCacheFile(*item, boost::shared_ptr<plinth::filesupport::File>(new plinth::filesupport::File()));
+  RK_TEST_Access::SetDiskCacheFile(
+      *item, boost::shared_ptr<plinth::filesupport::File>(new plinth::filesupport::File()));
   EXPECT_TRUE(item->IsOnDisk());
   RK_TEST_Access::SetDiskCacheFile(*item, nullptr);
   EXPECT_FALSE(item->IsOnDisk());
@@ -115,9 +116,9 @@ TEST(Stuff, CheckoutChecksCompareUnsigned) {
     bool lessThan;  // else moreThan
     int n, code;
   } cases[] = {
-      {0, true, 1, 0x3A04},          {0, true, 0, -1},  {3, true, 3, -1}, {3, true, 4, 0x3A04},
-      {3, true, -1, 0x3A04},  // -1 compares as the largest count
-      {1, false, 0, 0x3A03},         {1, false, 1, -1}, {0xFFFFFFFFu, false, -1, -1},
+      {0, true, 1, 0x3A04},  {0, true, 0, -1},      {3, true, 3, -1},
+      {3, true, 4, 0x3A04},  {3, true, -1, 0x3A04},  // -1 compares as the largest count
+      {1, false, 0, 0x3A03}, {1, false, 1, -1},     {0xFFFFFFFFu, false, -1, -1},
   };
   for (const auto& c : cases) {
     RK_TEST_Access::SetCheckoutCount(*item, c.count);

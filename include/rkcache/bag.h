@@ -83,7 +83,7 @@ class RK_EXPORT RK_Bag : public HK_MemTrackedObject, public boost::enable_shared
   // REQUIRES: the cache lock is held.
   boost::posix_time::ptime StampFor(const boost::posix_time::ptime& now) const;
 
-  RK_StuffByLastUse stuffByLastUse;  // cache lock
+  RK_StuffByLastUse stuffByLastUse;           // cache lock
   std::uint32_t lockHoldCount = 0;            // cache lock (raised by RK_ScCacheLock)
   std::atomic<bool> diskCacheEnabled{false};  // atomic: read without the lock
   plinth::filesupport::Dir diskCacheDir;      // written by the configuring thread

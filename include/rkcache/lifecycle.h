@@ -45,6 +45,6 @@ class RK_EXPORT RK_ScCacheLock {
 
  private:
   boost::unique_lock<boost::recursive_mutex> lock_;
-  RK_Bag* bag_;              // the global bag when the lock was taken
-  std::uint64_t bagEpoch_;   // and which one it was (see RK_Death)
+  RK_Bag* bag_;             // the global bag when the lock was taken
+  std::uint64_t bagEpoch_;  // and which one it was (see RK_Death)
 };

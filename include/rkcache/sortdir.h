@@ -65,6 +65,6 @@ class RK_EXPORT RK_SortDir : public HK_MemTrackedObject, public boost::enable_sh
   friend class RK_Stuff;
   friend class RK_TEST_Access;
 
-  RK_StuffByGuid stuffByGuid;           // cache lock
+  RK_StuffByGuid stuffByGuid;  // cache lock
   std::atomic<std::int64_t> changeCount{0};
 };

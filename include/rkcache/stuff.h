@@ -133,7 +133,7 @@ class RK_EXPORT RK_Stuff : public plinth::utility::RefCountedObject {
   std::size_t guidHash;                          // RK_GuidHash's value for guid, kept with it
   std::atomic<std::uint32_t> checkoutCount{0};   // written under the cache lock
   std::atomic<bool> checkedOutWriteable{false};  // written under the cache lock or by the sole holder
-  boost::posix_time::ptime lastUseTime;          // cache lock; never changed while in a bag's set
+  boost::posix_time::ptime lastUseTime;          // cache lock; a bag keeps its list sorted by it
   boost::shared_ptr<plinth::filesupport::File> diskCacheFile;  // cache lock
   boost::weak_ptr<RK_Bag> bag;                                 // cache lock
   RK_StuffByLastUse::iterator bagPosition;                     // cache lock; meaningful while bag is set

@@ -26,7 +26,11 @@ void Journal::Clear() {
 
 TestStuff::TestStuff(std::uint32_t size, bool inMemory, bool trackMemory, std::shared_ptr<Journal> journal,
                      std::string name)
-    : name_(std::move(name)), journal_(std::move(journal)), size_(size), inMemory_(false), trackMemory_(trackMemory) {
+    : name_(std::move(name)),
+      journal_(std::move(journal)),
+      size_(size),
+      inMemory_(false),
+      trackMemory_(trackMemory) {
   SetInMemory(inMemory);
 }
 
@@ -56,7 +60,9 @@ void TestStuff::SetInMemory(bool inMemory) {
   }
 }
 
-void TestStuff::SetOnDisk(std::optional<bool> onDisk) { onDisk_.store(onDisk ? (*onDisk ? 1 : 0) : -1); }
+void TestStuff::SetOnDisk(std::optional<bool> onDisk) {
+  onDisk_.store(onDisk ? (*onDisk ? 1 : 0) : -1);
+}
 
 bool TestStuff::IdenticalRequest(const RK_Stuff* request) const {
   Note("IdenticalRequest");
@@ -68,7 +74,9 @@ bool TestStuff::CanSatisfyRequest(const RK_Stuff* request) const {
   return canSatisfy_ ? canSatisfy_(request) : RK_Stuff::CanSatisfyRequest(request);
 }
 
-std::uint32_t TestStuff::GetSizeInBytes() { return size_.load(); }
+std::uint32_t TestStuff::GetSizeInBytes() {
+  return size_.load();
+}
 
 bool TestStuff::FreeMemory() {
   Note("FreeMemory");
@@ -87,6 +95,8 @@ bool TestStuff::IsOnDisk() const {
   return forced < 0 ? RK_Stuff::IsOnDisk() : forced == 1;
 }
 
-void TestStuff::YourDiskCacheFileWasDeleted() const { Note("YourDiskCacheFileWasDeleted"); }
+void TestStuff::YourDiskCacheFileWasDeleted() const {
+  Note("YourDiskCacheFileWasDeleted");
+}
 
 }  // namespace rktest
