@@ -5,7 +5,7 @@
 //
 // The items form a list sorted by `lastUseTime`; equal stamps keep the order
 // in which the items came in. Whoever stamps an item as used now (AddStuff,
-// check-in) stamps it no earlier than the newest item in the bag: the clock
+// check-in) stamps it no earlier than the latest stamp at the young end: the clock
 // is read before the lock, so a thread that read it a moment earlier may
 // arrive second, and a wall clock set back would otherwise file fresh uses
 // as the oldest, to be evicted first. The stamp thus always belongs at the
@@ -57,6 +57,7 @@ RK_Bag& RK_Bag::operator=(const RK_Bag& other) {
   diskCacheSizeLimit = other.diskCacheSizeLimit;
   diskCacheSize = other.diskCacheSize;
   appVersion = other.appVersion;
+  youngestStamp = other.youngestStamp;
   return *this;
 }
 
@@ -77,18 +78,17 @@ void RK_Bag::AddStuffGuts(boost::intrusive_ptr<RK_Stuff> stuff) {
   while (position != stuffByLastUse.begin() && (*std::prev(position))->lastUseTime > stuff->lastUseTime)
     --position;
   stuff->bagPosition = stuffByLastUse.insert(position, stuff.get());
+  if (position == stuffByLastUse.end() && stuff->lastUseTime > youngestStamp)
+    youngestStamp = stuff->lastUseTime;
   stuff->bag = weak_from_this();
 }
 
 boost::posix_time::ptime RK_Bag::StampFor(const boost::posix_time::ptime& now) const {
-  if (!stuffByLastUse.empty() && stuffByLastUse.back()->lastUseTime > now)
-    return stuffByLastUse.back()->lastUseTime;
-  return now;
+  return youngestStamp > now ? youngestStamp : now;
 }
 
 void RK_Bag::MarkUsed(RK_Stuff* stuff, const boost::posix_time::ptime& now) {
-  // Read before the move: the item itself may be the newest.
-  stuff->lastUseTime = StampFor(now);
+  stuff->lastUseTime = youngestStamp = StampFor(now);
   stuffByLastUse.splice(stuffByLastUse.end(), stuffByLastUse, stuff->bagPosition);
 }
 

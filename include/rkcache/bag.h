@@ -79,11 +79,14 @@ class RK_EXPORT RK_Bag : public HK_MemTrackedObject, public boost::enable_shared
   // Stamps an item of this bag as used at `now` and moves it to the young
   // end. REQUIRES: the cache lock is held; the item is in this bag.
   void MarkUsed(RK_Stuff* stuff, const boost::posix_time::ptime& now);
-  // `now`, or the newest stamp in the bag if that is later (see bag.cpp).
+  // `now`, or the latest stamp given at the young end if later (see bag.cpp).
   // REQUIRES: the cache lock is held.
   boost::posix_time::ptime StampFor(const boost::posix_time::ptime& now) const;
 
-  RK_StuffByLastUse stuffByLastUse;           // cache lock
+  RK_StuffByLastUse stuffByLastUse;  // cache lock
+  // The latest stamp an item took at the young end; kept here so that a
+  // use reads no other item. Cache lock.
+  boost::posix_time::ptime youngestStamp{boost::posix_time::min_date_time};
   std::uint32_t lockHoldCount = 0;            // cache lock (raised by RK_ScCacheLock)
   std::atomic<bool> diskCacheEnabled{false};  // atomic: read without the lock
   plinth::filesupport::Dir diskCacheDir;      // written by the configuring thread
