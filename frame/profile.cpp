@@ -22,7 +22,7 @@ constexpr ScopeDef kScopes[RKp_Profile_Count] = {
 // A log is created once, inside its call_once, and lives until the process
 // ends. boost::call_once marks its flag done inside libboost_thread, which a
 // ThreadSanitizer build does not instrument, so the log is also published
-// through `log` (release here, acquire in RKp_ProfileLogFor): that pair is
+// through `log` (release here, acquire in RKp_ProfileLogForVolume): that pair is
 // the ordering every build can see.
 struct ScopeLog {
   boost::once_flag once = BOOST_ONCE_INIT;
@@ -39,9 +39,8 @@ void CreateLog(RKp_ProfileScopeId id) {
 
 }  // namespace
 
-boost::intrusive_ptr<plinth::debug::ProfileDataLog> RKp_ProfileLogFor(RKp_ProfileScopeId id) {
-  plinth::debug::CodeProfilerManager& manager = plinth::debug::CodeProfilerManager::Get();
-  if (!manager.IsConditionalProfiling() || manager.GetProfilingVolume() < kScopes[id].volume) return {};
+boost::intrusive_ptr<plinth::debug::ProfileDataLog> RKp_ProfileLogForVolume(RKp_ProfileScopeId id) {
+  if (plinth::debug::CodeProfilerManager::GetProfilingVolume() < kScopes[id].volume) return {};
   boost::call_once(S_logs[id].once, [id] { CreateLog(id); });
   return boost::intrusive_ptr<plinth::debug::ProfileDataLog>(S_logs[id].log.load(std::memory_order_acquire));
 }

@@ -18,8 +18,15 @@ enum RKp_ProfileScopeId {
   RKp_Profile_Count
 };
 
-// The log for a scope if profiling is on at its volume (created once),
-// else an empty pointer.
-RK_INTERNAL boost::intrusive_ptr<plinth::debug::ProfileDataLog> RKp_ProfileLogFor(RKp_ProfileScopeId id);
+// The log for a scope if profiling is on at its volume (created once).
+RK_INTERNAL boost::intrusive_ptr<plinth::debug::ProfileDataLog> RKp_ProfileLogForVolume(
+    RKp_ProfileScopeId id);
+
+// The same, or an empty pointer: the common "profiling is off" answer is
+// given inline, as scopes open on the hit path.
+inline boost::intrusive_ptr<plinth::debug::ProfileDataLog> RKp_ProfileLogFor(RKp_ProfileScopeId id) {
+  if (!plinth::debug::CodeProfilerManager::IsConditionalProfiling()) return {};
+  return RKp_ProfileLogForVolume(id);
+}
 
 #define RK_PROFILE_SCOPE(id) plinth::debug::CodeProfiler rk_profile_scope_(RKp_ProfileLogFor(id))

@@ -112,10 +112,8 @@ std::vector<std::chrono::nanoseconds> ProfileDataLog::Intervals() const {
 
 // ---------------------------------------------------------------------------
 
-namespace {
-std::atomic<bool> g_conditionalProfiling{false};
-std::atomic<int> g_profilingVolume{0};
-}  // namespace
+std::atomic<bool> CodeProfilerManager::conditionalProfiling_{false};
+std::atomic<int> CodeProfilerManager::profilingVolume_{0};
 
 CodeProfilerManager& CodeProfilerManager::Get() {
   // Never destroyed: module-wide logs live until the process ends.
@@ -123,17 +121,11 @@ CodeProfilerManager& CodeProfilerManager::Get() {
   return *manager;
 }
 
-bool CodeProfilerManager::IsConditionalProfiling() const {
-  return g_conditionalProfiling.load();
-}
-int CodeProfilerManager::GetProfilingVolume() const {
-  return g_profilingVolume.load();
-}
 void CodeProfilerManager::SetConditionalProfiling(bool on) {
-  g_conditionalProfiling.store(on);
+  conditionalProfiling_.store(on);
 }
 void CodeProfilerManager::SetProfilingVolume(int volume) {
-  g_profilingVolume.store(volume);
+  profilingVolume_.store(volume);
 }
 
 boost::intrusive_ptr<ProfileDataLog> CodeProfilerManager::CreateNewProfileDataLog(const std::string& name,
@@ -162,12 +154,7 @@ std::string CodeProfilerManager::Report() const {
   return out.str();
 }
 
-CodeProfiler::CodeProfiler(boost::intrusive_ptr<ProfileDataLog> log) : log_(std::move(log)) {
-  if (log_) start_ = std::chrono::steady_clock::now();
-}
-
-CodeProfiler::~CodeProfiler() {
-  if (!log_) return;
+void CodeProfiler::Finish() {
   log_->Record(
       std::chrono::duration_cast<std::chrono::nanoseconds>(std::chrono::steady_clock::now() - start_));
 }

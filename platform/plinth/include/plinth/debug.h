@@ -8,12 +8,14 @@
 // Thread safety: everything here may be called from any thread.
 #pragma once
 
+#include <atomic>
 #include <boost/function.hpp>
 #include <boost/intrusive_ptr.hpp>
 #include <chrono>
 #include <cstdint>
 #include <mutex>
 #include <string>
+#include <utility>
 #include <vector>
 
 #include "plinth/export.h"
@@ -65,8 +67,9 @@ class PLINTH_API CodeProfilerManager {
  public:
   static CodeProfilerManager& Get();
 
-  bool IsConditionalProfiling() const;
-  int GetProfilingVolume() const;
+  // Inline: profiled code asks on every call, almost always to hear "off".
+  static bool IsConditionalProfiling() { return conditionalProfiling_.load(std::memory_order_relaxed); }
+  static int GetProfilingVolume() { return profilingVolume_.load(std::memory_order_relaxed); }
   void SetConditionalProfiling(bool on);
   void SetProfilingVolume(int volume);
 
@@ -78,6 +81,8 @@ class PLINTH_API CodeProfilerManager {
 
  private:
   CodeProfilerManager() = default;
+  static std::atomic<bool> conditionalProfiling_;
+  static std::atomic<int> profilingVolume_;
   mutable std::mutex mutex_;
   std::vector<boost::intrusive_ptr<ProfileDataLog>> logs_;  // guarded by mutex_
 };
@@ -86,12 +91,18 @@ class PLINTH_API CodeProfilerManager {
 // an empty log it does nothing (and reads no clock).
 class PLINTH_API CodeProfiler {
  public:
-  explicit CodeProfiler(boost::intrusive_ptr<ProfileDataLog> log);
-  ~CodeProfiler();
+  explicit CodeProfiler(boost::intrusive_ptr<ProfileDataLog> log) : log_(std::move(log)) {
+    if (log_) start_ = std::chrono::steady_clock::now();
+  }
+  ~CodeProfiler() {
+    if (log_) Finish();
+  }
   CodeProfiler(const CodeProfiler&) = delete;
   CodeProfiler& operator=(const CodeProfiler&) = delete;
 
  private:
+  void Finish();
+
   boost::intrusive_ptr<ProfileDataLog> log_;
   std::chrono::steady_clock::time_point start_;
 };
