@@ -1,8 +1,7 @@
-// Memory statistic 6 with tracked allocation, and the millisecond clock.
+// The tracked-memory statistic and the millisecond clock.
 #include <gtest/gtest.h>
 
 #include <ctime>
-#include <memory>
 
 #include "host/control.h"
 #include "host/hk.h"
@@ -17,7 +16,6 @@ struct SmallItem : HK_MemTrackedObject {
 
 struct Base : HK_MemTrackedObject {
   virtual ~Base() = default;
-  int tag = 0;
 };
 struct Large : Base {
   char payload[5000];
@@ -40,17 +38,6 @@ TEST(HostMemory, TrackedObjectsMoveTheStatisticBySize) {
   EXPECT_EQ(start + sizeof(Large), Stat());
   delete large;
   EXPECT_EQ(start, Stat());
-  EXPECT_EQ(start, ctl::MemoryStat());
-
-  void* block = HK_TrackedAlloc(4096);
-  ASSERT_NE(nullptr, block);
-  HK_TrackBytes(1000);
-  EXPECT_EQ(start + 5096, Stat());
-  HK_TrackBytes(-1000);
-  HK_TrackedFree(block, 4096);
-  EXPECT_EQ(start, Stat());
-  HK_TrackedFree(nullptr, 4096);  // freeing nothing changes nothing
-  EXPECT_EQ(start, Stat());
 }
 
 TEST(HostMemory, StatisticCanBeSetAndNeverGoesBelowZero) {
@@ -60,24 +47,8 @@ TEST(HostMemory, StatisticCanBeSetAndNeverGoesBelowZero) {
   ctl::SetMemoryStat(10);
   delete item;  // frees more than the statistic holds
   EXPECT_EQ(0u, Stat());
-  HK_TrackBytes(-5);
-  EXPECT_EQ(0u, Stat());
-  HK_TrackBytes(7);
-  EXPECT_EQ(7u, ctl::MemoryStat());
-}
-
-TEST(HostMemory, FailuresOfTheStatistic) {
-  ctl::SetMemoryStat(123);
-  std::uint64_t value = 55;
-  EXPECT_EQ(HK_ErrUnknownSelector, HK_GetMemoryStat(5, &value));
-  EXPECT_EQ(55u, value);
-  EXPECT_EQ(HK_ErrBadParameter, HK_GetMemoryStat(HK_MemStatItemBytes, nullptr));
-  ctl::FailMemoryStat(-9);
-  EXPECT_EQ(-9, HK_GetMemoryStat(HK_MemStatItemBytes, &value));
-  EXPECT_EQ(55u, value);
-  ctl::FailMemoryStat(0);
-  EXPECT_EQ(0, HK_GetMemoryStat(HK_MemStatItemBytes, &value));
-  EXPECT_EQ(123u, value);
+  HK_TrackBytes(7);  // counts from zero, not from a wrapped value
+  EXPECT_EQ(7u, Stat());
 }
 
 std::uint64_t SystemMonotonicMs() {
@@ -93,10 +64,6 @@ TEST(HostClock, MonotonicAndTestClocks) {
   const std::uint64_t after = SystemMonotonicMs();
   EXPECT_LE(before, ms);
   EXPECT_GE(after, ms);
-  std::uint64_t later = 0;
-  ASSERT_EQ(0, HK_MillisecondsSinceBoot(&later));
-  EXPECT_LE(ms, later);
-  EXPECT_EQ(HK_ErrBadParameter, HK_MillisecondsSinceBoot(nullptr));
 
   ctl::UseTestClock(true);
   ctl::SetTestClock(1000);
