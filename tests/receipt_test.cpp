@@ -1,5 +1,5 @@
-// Receipts: checking in on reuse and destruction, release, swap, errors in
-// the destructor, the was-on-disk flag, and copies sharing one check-out.
+// Receipts: checking in on reuse and destruction, release, swap, move,
+// errors in the destructor, the was-on-disk flag, and shared copies.
 #include "support/file_stuff.h"
 #include "support/module_fixture.h"
 
@@ -17,35 +17,21 @@ TEST_F(ReceiptTest, ChecksInOnReuseAndDestructionButNotAfterAFailedCheckout) {
   TestStuffPtr a = Enter(TestStuff::Make());
   TestStuffPtr b = Enter(TestStuff::Make());
   {
-    RK_ScCheckout empty;
-    EXPECT_FALSE(empty.DidCheckout() || empty.IsOnDisk() || empty.GetStuff());
-    EXPECT_EQ(empty.GetResult(), RK_CheckoutResult_NotCheckedOut);
-  }
-  {
     RK_ScCheckout receipt(a.get(), kReadOnly);
-    EXPECT_TRUE(receipt.IsInMemory());
-    EXPECT_EQ(receipt.GetStuff(), a.get());
-    // Reuse on the same item checks the first check-out in first...
     EXPECT_EQ(receipt.Checkout(a.get(), kReadOnly), RK_CheckoutResult_CheckedOut);
-    EXPECT_EQ(a->GetCheckoutCount(), 1u);
-    // ...and on another item too.
+    EXPECT_EQ(a->GetCheckoutCount(), 1u);  // the first was checked in first
     EXPECT_EQ(receipt.Checkout(b.get(), kReadOnly), RK_CheckoutResult_CheckedOut);
     EXPECT_EQ(a->GetCheckoutCount(), 0u);
-    EXPECT_EQ(b->GetCheckoutCount(), 1u);
-    // A lookup through the global directory, after checking b in.
     EXPECT_EQ(receipt.FindAndCheckout(a.get(), kReadOnly), RK_CheckoutResult_CheckedOut);
     EXPECT_EQ(b->GetCheckoutCount(), 0u);
-    EXPECT_EQ(receipt.GetStuff(), a.get());
   }
   EXPECT_EQ(a->GetCheckoutCount(), 0u);
-  EXPECT_EQ(a->RefCountForDiagnostics(), 2u);
 
-  // Flags the item cannot meet: nothing held, nothing checked in later.
+  // A failed check-out holds nothing, so its destructor checks nothing in.
   a->SetInMemory(false);
   {
     RK_ScCheckout receipt(a.get(), kReadOnly | RK_Checkout_OnlyIfInMemory);
     EXPECT_FALSE(receipt.DidCheckout());
-    EXPECT_EQ(receipt.GetStuff(), nullptr);
     a->SetInMemory(true);
     ASSERT_EQ(a->Checkout(kReadOnly), RK_CheckoutResult_CheckedOut);  // someone else's
   }
@@ -55,7 +41,6 @@ TEST_F(ReceiptTest, ChecksInOnReuseAndDestructionButNotAfterAFailedCheckout) {
   // Checkin passes its flags and empties the receipt; a second does nothing.
   RK_ScCheckout receipt(a.get(), kReadOnly);
   receipt.Checkin(RK_Checkin_Discard, {});
-  EXPECT_FALSE(receipt.DidCheckout() || receipt.GetStuff());
   EXPECT_FALSE(a->GetBag());
   receipt.Checkin(0, {});
   EXPECT_EQ(a->GetCheckoutCount(), 0u);
@@ -75,8 +60,6 @@ TEST_F(ReceiptTest, ReleaseHandsTheCheckoutOverAndSwapAndMoveTransferIt) {
     RK_ScCheckout receipt(a.get(), kReadOnly);
     released = receipt.Release();
     EXPECT_EQ(released, a.get());
-    EXPECT_FALSE(receipt.DidCheckout());
-    EXPECT_EQ(receipt.GetStuff(), a.get());      // still named, and still referenced
     EXPECT_EQ(a->RefCountForDiagnostics(), 4u);  // test, directory, check-out, receipt
   }
   EXPECT_EQ(a->GetCheckoutCount(), 1u);  // the destructor did not check in
@@ -86,8 +69,7 @@ TEST_F(ReceiptTest, ReleaseHandsTheCheckoutOverAndSwapAndMoveTransferIt) {
   {
     RK_ScCheckout empty;
     empty.Swap(holder);
-    EXPECT_TRUE(empty.DidCheckout());
-    EXPECT_FALSE(holder.DidCheckout() || holder.GetStuff());
+    EXPECT_FALSE(holder.DidCheckout());
   }
   EXPECT_EQ(a->GetCheckoutCount(), 0u);  // checked in once, by the new holder
 
@@ -97,7 +79,7 @@ TEST_F(ReceiptTest, ReleaseHandsTheCheckoutOverAndSwapAndMoveTransferIt) {
   RK_ScCheckout target;
   target = std::move(moved);
   EXPECT_EQ(a->GetCheckoutCount(), 1u);
-  target = RK_ScCheckout();  // lets go of the check-out
+  target = RK_ScCheckout();
   EXPECT_EQ(a->GetCheckoutCount(), 0u);
 }
 
@@ -106,31 +88,26 @@ TEST_F(ReceiptTest, CopiesShareOneCheckoutAndCheckItInOnce) {
   TestStuffPtr b = Enter(TestStuff::Make());
   {
     RK_ScCheckout original(a.get(), kReadOnly);
-    // Test, directory and the check-out: a lone holder takes no reference.
-    EXPECT_EQ(a->RefCountForDiagnostics(), 3u);
+    EXPECT_EQ(a->RefCountForDiagnostics(), 3u);  // a lone holder takes no reference
     {
       RK_ScCheckout copy(original);
       RK_ScCheckout another = copy;
-      EXPECT_TRUE(another.DidCheckout() && another.GetStuff() == a.get());
       EXPECT_EQ(a->GetCheckoutCount(), 1u);
       EXPECT_EQ(a->RefCountForDiagnostics(), 5u);  // each copy keeps the item alive
     }
-    EXPECT_EQ(a->GetCheckoutCount(), 1u);  // the original still holds it
     EXPECT_EQ(a->RefCountForDiagnostics(), 3u);
   }
-  EXPECT_EQ(a->GetCheckoutCount(), 0u);
   EXPECT_EQ(a->RefCountForDiagnostics(), 2u);
 
-  // Check-in through one copy lets go of its share; the last checks in with its flags.
+  // The last holder checks in with its own flags.
   {
     RK_ScCheckout original(a.get(), kReadOnly);
     RK_ScCheckout copy(original);
     original.Checkin(RK_Checkin_Discard, {});
-    EXPECT_FALSE(original.DidCheckout());
     EXPECT_EQ(a->GetCheckoutCount(), 1u);
     copy.Checkin(RK_Checkin_KeepLastUse, {});
     EXPECT_EQ(a->GetCheckoutCount(), 0u);
-    EXPECT_TRUE(a->GetBag());  // kept: the last holder did not discard
+    EXPECT_TRUE(a->GetBag());
   }
 
   // Assignment lets go of what the target held, then shares the source's.
@@ -140,8 +117,7 @@ TEST_F(ReceiptTest, CopiesShareOneCheckoutAndCheckItInOnce) {
     onB = onA;
     EXPECT_EQ(b->GetCheckoutCount(), 0u);
     RK_ScCheckout& alias = onB;
-    onB = alias;  // self-assignment keeps the share
-    EXPECT_TRUE(onB.DidCheckout());
+    onB = alias;
     onA = RK_ScCheckout();
     EXPECT_EQ(a->GetCheckoutCount(), 1u);
   }
@@ -154,13 +130,10 @@ TEST_F(ReceiptTest, CopiesShareOneCheckoutAndCheckItInOnce) {
     RK_ScCheckout copy(original);
     released = copy.Release();
     EXPECT_FALSE(original.DidCheckout());
-    EXPECT_FALSE(RK_ScCheckout(original).DidCheckout());
-    EXPECT_EQ(a->RefCountForDiagnostics(), 5u);  // test, directory, check-out, both receipts
   }
   EXPECT_EQ(a->GetCheckoutCount(), 1u);
   EXPECT_EQ(a->RefCountForDiagnostics(), 3u);
   released->Checkin(0, {});
-  EXPECT_EQ(a->RefCountForDiagnostics(), 2u);
 
   // Copies on two threads let go at the same time: exactly one check-in.
   for (int round = 0; round < 50; ++round) {
@@ -180,8 +153,7 @@ TEST_F(ReceiptTest, WasOnDiskAndEnsureInMemory) {
   RK_TEST_Access::SetDiskCacheFile(*item, rktest::WriteFile(folder, "r.vxcache", rktest::CountingBytes(64)));
   {
     RK_ScCheckout receipt(item.get(), kReadOnly);
-    ASSERT_TRUE(receipt.DidCheckout());
-    EXPECT_TRUE(receipt.IsInMemory());
+    ASSERT_TRUE(receipt.IsInMemory());
     // Still true once the item's file is gone: it was on disk when tried.
     RK_TEST_Access::SetDiskCacheFile(*item, nullptr);
     EXPECT_TRUE(receipt.IsOnDisk());
@@ -214,10 +186,6 @@ TEST_F(ReceiptTest, ConflictsLeaveTheReceiptEmptyAndTheDestructorSwallowsCheckin
   EXPECT_EQ(ThrownCode([&] { reader.FindAndCheckout(b.get(), 0); }), 0x3A03);
   EXPECT_FALSE(reader.DidCheckout());
   EXPECT_EQ(b->GetCheckoutCount(), 1u);
-  EXPECT_EQ(a->GetCheckoutCount(), 1u);
-  EXPECT_EQ(rktest::ReportDetails(),
-            (std::vector<std::string>{"cached item already checked-out read/write",
-                                      "cannot check-out read/write already checked-out item"}));
   writer.Release()->Checkin(0, {});
 
   // Ended behind the receipt's back, its destructor's check-in fails quietly.

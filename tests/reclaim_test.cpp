@@ -50,37 +50,23 @@ TEST_F(ReclaimTest, FreesDiskBackedMemoryFirstThenDropsOldestMemoryOnlyItems) {
   EXPECT_EQ(bag->FreeUpSomeMemory(250), RK_Bag::FreeUpResult_FreedEnough);
   EXPECT_EQ(Stat(), 1000200u);
   EXPECT_EQ(PurgeLines(), Lines{"numFreed:1, numWalked:6, Total: 4"});
-  EXPECT_EQ(journal->Count("i0:destroyed"), 1);
   EXPECT_EQ(Order(), (std::vector<RK_Stuff*>{items[1], items[2], items[3], items[4]}));
-  // Two memory releases (the statistic shows them) and one removal.
-  EXPECT_EQ(dir->GetLastChangeTime(), changes + 3);
+  EXPECT_EQ(dir->GetLastChangeTime(), changes + 3);  // two memory releases, one removal
 }
 
 TEST_F(ReclaimTest, ResultsAtTheEdges) {
   EnterItems(4, {0, 1, 2, 3});
-  // Everything is on disk and freeing it all is not enough: FreedSome,
-  // pass 2 walks every item and drops none.
+  // All on disk and freeing it all is not enough: FreedSome, nothing dropped.
   EXPECT_EQ(bag->FreeUpSomeMemory(10000), RK_Bag::FreeUpResult_FreedSome);
   EXPECT_EQ(Stat(), 1000000u);
   EXPECT_EQ(bag->GetStuffCount(), 4u);
-  // Nothing left to free: the statistic never falls.
   EXPECT_EQ(bag->FreeUpSomeMemory(0), RK_Bag::FreeUpResult_NothingFreed);
   EXPECT_EQ(PurgeLines(), (Lines{"numFreed:0, numWalked:8, Total: 4", "numFreed:0, numWalked:8, Total: 4"}));
 }
 
-TEST_F(ReclaimTest, WantedZeroStopsAtTheFirstDrop) {
-  EnterItems(3);
-  EXPECT_EQ(bag->FreeUpSomeMemory(0), RK_Bag::FreeUpResult_FreedEnough);
-  EXPECT_EQ(Stat(), 1000200u);
-  EXPECT_EQ(journal->Count("i0:destroyed"), 1);
-  EXPECT_EQ(PurgeLines(), Lines{"numFreed:1, numWalked:4, Total: 2"});
-}
-
 TEST_F(ReclaimTest, UntrackedItemsAreDroppedButNothingCountsAsFreed) {
-  // The statistic does not see these: all walked twice and dropped, nothing counted.
   EnterItems(3, {}, false);
   EXPECT_EQ(bag->FreeUpSomeMemory(50), RK_Bag::FreeUpResult_NothingFreed);
-  EXPECT_EQ(bag->GetStuffCount(), 0u);
   EXPECT_EQ(PurgeLines(), Lines{"numFreed:3, numWalked:6, Total: 0"});
 }
 
@@ -89,13 +75,11 @@ TEST_F(ReclaimTest, CheckedOutItemsAreWalkedButNeverFreed) {
   for (RK_Stuff* s : items) RK_TEST_Access::SetCheckoutCount(*s, 1);
   EXPECT_EQ(bag->FreeUpSomeMemory(1), RK_Bag::FreeUpResult_NothingFreed);
   EXPECT_EQ(PurgeLines(), Lines{"numFreed:0, numWalked:6, Total: 3"});
-  EXPECT_EQ(journal->Count("i1:FreeMemory"), 0);
   // Dropping a checked-out item directly, or purging, does nothing either.
   items[0]->RemoveFromBagAndSortDir();
-  EXPECT_EQ(items[0]->GetBag(), bag);
   bag->PurgeAllMemoryCaches();
   EXPECT_EQ(Stat(), 1000300u);
-  for (RK_Stuff* s : items) EXPECT_EQ(s->GetSortDir(), dir);
+  EXPECT_EQ(bag->GetStuffCount(), 3u);
   for (RK_Stuff* s : items) RK_TEST_Access::SetCheckoutCount(*s, 0);
 }
 
@@ -117,22 +101,17 @@ TEST_F(ReclaimTest, PurgeFreesEverythingAndKeepsOnlyDiskBackedItems) {
   bag->PurgeAllMemoryCaches();
   EXPECT_EQ(Stat(), 1000000u);
   EXPECT_EQ(Order(), std::vector<RK_Stuff*>{items[2]});
-  EXPECT_EQ(dir->GetStuffCount(), 1u);
   EXPECT_EQ(dir->GetLastChangeTime(), changes + 7);  // four memory releases, three removals
-  for (int i : {0, 1, 3}) EXPECT_EQ(journal->Count("i" + std::to_string(i) + ":destroyed"), 1);
 }
 
 TEST_F(ReclaimTest, FreeUpAsMuchAsPossibleReportsWhetherMemoryWasFreed) {
   auto item = Make("x", 100, true, true);
   item->SetOnDisk(true);
   Enter(item);
-  const auto changes = dir->GetLastChangeTime();
   item->SetFreeMemoryRefuses(true);
   EXPECT_FALSE(RK_TEST_Access::FreeUpAsMuchAsPossible(*item));
-  EXPECT_EQ(dir->GetLastChangeTime(), changes);
   item->SetFreeMemoryRefuses(false);
   EXPECT_TRUE(RK_TEST_Access::FreeUpAsMuchAsPossible(*item));
-  EXPECT_EQ(dir->GetLastChangeTime(), changes + 1);
   EXPECT_EQ(item->GetBag(), bag);  // on disk: stays indexed
   // Already free: FreeMemory is not asked again.
   EXPECT_FALSE(RK_TEST_Access::FreeUpAsMuchAsPossible(*item));
@@ -141,7 +120,6 @@ TEST_F(ReclaimTest, FreeUpAsMuchAsPossibleReportsWhetherMemoryWasFreed) {
   item->SetOnDisk(false);
   EXPECT_FALSE(RK_TEST_Access::FreeUpAsMuchAsPossible(*item));
   EXPECT_FALSE(item->GetBag());
-  EXPECT_FALSE(item->GetSortDir());
 }
 
 }  // namespace

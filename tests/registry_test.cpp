@@ -1,6 +1,5 @@
-// The subclass factory registry: registration and replacement, exact
-// case-sensitive names, header bytes passed unchanged, and discarding by
-// RK_Stuff::Death and RK_Death.
+// The subclass factory registry: registration and replacement, exact names,
+// header bytes passed unchanged, and discarding by RK_Stuff::Death and RK_Death.
 #include <gtest/gtest.h>
 
 #include <boost/make_shared.hpp>
@@ -36,12 +35,9 @@ boost::intrusive_ptr<RK_Stuff> Create(const char* name, const RK_HeaderBytes& he
 }  // namespace
 
 TEST(Registry, AbsentUntilTheFirstRegistration) {
-  EXPECT_EQ(RK_TEST_Access::FactoryRegistry(), nullptr);
   EXPECT_FALSE(Create("Frame"));
-  EXPECT_EQ(RK_TEST_Access::FactoryRegistry(), nullptr);  // a lookup creates nothing
-
   RK_Birth(false);
-  EXPECT_EQ(RK_TEST_Access::FactoryRegistry(), nullptr);  // nor does birth
+  EXPECT_EQ(RK_TEST_Access::FactoryRegistry(), nullptr);  // neither a lookup nor birth makes one
   RK_StopAllAsyncWork();
   RK_Death();
 }
@@ -49,72 +45,46 @@ TEST(Registry, AbsentUntilTheFirstRegistration) {
 TEST(Registry, LaterRegistrationReplacesNamesMatchExactlyAndHeadersPassUnchanged) {
   RecordingFactory first{"first"};
   RecordingFactory second{"second"};
-  RecordingFactory lower{"lower"};
-
   RK_Stuff::RegisterFactory("Frame", first);
-  EXPECT_EQ(TagOf(Create("Frame")), "first");
   RK_Stuff::RegisterFactory("Frame", second);
-  // Header bytes reach the factory unchanged.
   RK_HeaderBytes bytes;
   for (int i = 0; i < 300; ++i) bytes.push_back(static_cast<unsigned char>(i * 7));
-  bytes.push_back(0);
-  bytes.push_back(0xFF);
   EXPECT_EQ(TagOf(Create("Frame", bytes)), "second");
-  EXPECT_EQ(TagOf(Create("Frame")), "second");
-  EXPECT_EQ(first.headers->size(), 1u);
-  EXPECT_EQ(*second.headers, (std::vector<RK_HeaderBytes>{bytes, RK_HeaderBytes{}}));
-
-  // Letter case and length matter.
+  EXPECT_TRUE(first.headers->empty());
+  EXPECT_EQ(*second.headers, std::vector<RK_HeaderBytes>{bytes});
   EXPECT_FALSE(Create("frame"));
-  EXPECT_FALSE(Create("FRAME"));
-  EXPECT_FALSE(Create("Frame "));
   EXPECT_FALSE(Create("Fram"));
-  RK_Stuff::RegisterFactory("frame", lower);
-  EXPECT_EQ(TagOf(Create("frame")), "lower");
-  EXPECT_EQ(TagOf(Create("Frame")), "second");
-  EXPECT_EQ(RK_TEST_Access::FactoryRegistry()->size(), 2u);
-
   RK_Stuff::Death();
 }
 
 TEST(Registry, EmptyOrNullFactoriesYieldNullAndFactoryErrorsPassThrough) {
   RK_Stuff::RegisterFactory("Empty", RK_Factory());
   EXPECT_FALSE(Create("Empty"));
-
   RK_Stuff::RegisterFactory("Null", [](const RK_HeaderBytes&) { return boost::intrusive_ptr<RK_Stuff>(); });
   EXPECT_FALSE(Create("Null"));
-
   RK_Stuff::RegisterFactory("Rejects", [](const RK_HeaderBytes& header) -> boost::intrusive_ptr<RK_Stuff> {
     if (header.empty()) throw std::invalid_argument("empty header");
     throw 0x3A07;
   });
   EXPECT_THROW(Create("Rejects"), std::invalid_argument);
   EXPECT_EQ(rktest::ThrownCode([] { Create("Rejects", RK_HeaderBytes{1}); }), 0x3A07);
-
   RK_Stuff::Death();
 }
 
 TEST(Registry, DeathDiscardsTheCopiesAndRegistrationStartsAfresh) {
   RecordingFactory factory{"old"};
-  const long before = factory.headers.use_count();
   RK_Stuff::RegisterFactory("Frame", factory);
   RK_Stuff::RegisterFactory("Other", factory);
-  // The registry holds copies of its own.
-  EXPECT_EQ(factory.headers.use_count(), before + 2);
-
+  EXPECT_EQ(factory.headers.use_count(), 3);  // the registry holds copies of its own
   RK_Stuff::Death();
   EXPECT_EQ(RK_TEST_Access::FactoryRegistry(), nullptr);
-  EXPECT_EQ(factory.headers.use_count(), before);
-  EXPECT_FALSE(Create("Frame"));
+  EXPECT_EQ(factory.headers.use_count(), 1);
   RK_Stuff::Death();  // a second discard finds nothing to do
-  EXPECT_EQ(RK_TEST_Access::FactoryRegistry(), nullptr);
 
   RecordingFactory fresh{"fresh"};
   RK_Stuff::RegisterFactory("Frame", fresh);
   EXPECT_EQ(TagOf(Create("Frame")), "fresh");
   EXPECT_FALSE(Create("Other"));
-  EXPECT_EQ(RK_TEST_Access::FactoryRegistry()->size(), 1u);
-  EXPECT_TRUE(factory.headers->empty());
 
   // Module shut-down discards it the same way.
   RK_Birth(false);
@@ -122,5 +92,4 @@ TEST(Registry, DeathDiscardsTheCopiesAndRegistrationStartsAfresh) {
   RK_Death();
   EXPECT_EQ(RK_TEST_Access::FactoryRegistry(), nullptr);
   EXPECT_EQ(fresh.headers.use_count(), 1);
-  EXPECT_FALSE(Create("Frame"));
 }

@@ -11,12 +11,6 @@ using SizesTest = rktest::ModuleTest;
 
 TEST_F(SizesTest, TotalsCountItemsByWhereTheirDataLives) {
   auto local = boost::shared_ptr<RK_Bag>(new RK_Bag);
-  std::uint64_t memory = 7, disk = 7;
-  local->GetCacheSizesInBytes(memory, disk);
-  EXPECT_EQ(memory, 0u);
-  EXPECT_EQ(disk, 0u);
-  EXPECT_EQ(local->GetCurrentDiskCacheSize(), 0);
-
   auto memOnly = TestStuff::Make(1);
   auto both = TestStuff::Make(20);
   both->SetOnDisk(true);
@@ -29,6 +23,7 @@ TEST_F(SizesTest, TotalsCountItemsByWhereTheirDataLives) {
   auto big = TestStuff::Make(0xFFFFFFFFu);  // widened, not wrapped
   for (auto* s : {memOnly.get(), both.get(), diskOnly.get(), neither.get(), checkedOut.get(), big.get()})
     local->AddStuff(s);
+  std::uint64_t memory = 7, disk = 7;
   local->GetCacheSizesInBytes(memory, disk);
   EXPECT_EQ(memory, 1u + 20u + 50000u + 0xFFFFFFFFull);
   EXPECT_EQ(disk, 20u + 300u);

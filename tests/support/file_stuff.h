@@ -1,6 +1,5 @@
 // A test item whose payload lives in a real cache file: Read reads it back
-// and puts the item into memory, or fails on demand. Plus a helper that
-// writes such a file into a temporary folder.
+// and puts the item into memory, or fails on demand.
 #pragma once
 
 #include <atomic>
@@ -22,7 +21,7 @@ class FileStuff : public TestStuff {
 
   static boost::intrusive_ptr<FileStuff> Make(std::uint32_t size, std::shared_ptr<Journal> journal = nullptr,
                                               std::string name = "item") {
-    return boost::intrusive_ptr<FileStuff>(new FileStuff(size, std::move(journal), std::move(name)));
+    return new FileStuff(size, std::move(journal), std::move(name));
   }
 
   void SetReadFailure(Failure f) { failure_.store(f); }
@@ -54,8 +53,7 @@ class FileStuff : public TestStuff {
   std::vector<unsigned char> payload_;
 };
 
-// Writes `bytes` to a new file `name` in `dir` and returns it as a file
-// object ready to be an item's cache file.
+// Writes `bytes` to a new file `name` in `dir`, ready to be an item's cache file.
 inline boost::shared_ptr<plinth::filesupport::File> WriteFile(const TempDir& dir, const std::string& name,
                                                               const std::vector<unsigned char>& bytes) {
   const std::string path = dir.Path() + "/" + name;

@@ -1,5 +1,5 @@
-// The fixture shared by the module's suites: the module is born on a main
-// thread with nothing captured and dies after each test; plus common helpers.
+// The module is born on a main thread with nothing captured and dies after
+// each test.
 #pragma once
 
 #include <gtest/gtest.h>
@@ -8,7 +8,6 @@
 #include <memory>
 #include <string>
 #include <thread>
-#include <utility>
 #include <vector>
 
 #include "host/control.h"
@@ -31,8 +30,7 @@ int ThrownCode(F&& f) {
 
 using Verification = std::pair<int, std::string>;
 std::vector<Verification> Verifications();
-// The detail texts of the captured error reports; each must carry the
-// module's group and the number 2.
+// The captured error reports' texts; each must carry group 0x3A0000, number 2.
 std::vector<std::string> ReportDetails();
 // Runs f on a new thread, marked as a render thread or not.
 template <class F>

@@ -1,6 +1,5 @@
-// RK_TEST_Access: the declared test hook into the module's private state.
-// Only test code defines and uses it; the module befriends it and nothing
-// else.
+// The declared test hook into the module's private state, which the module
+// befriends.
 #pragma once
 
 #include <boost/intrusive_ptr.hpp>
@@ -10,7 +9,6 @@
 
 class RK_TEST_Access {
  public:
-  // ---- RK_Stuff ----
   static void ThrowIfCheckedOutLessThan(const RK_Stuff& s, int n) { s.ThrowIfCheckedOutLessThan(n); }
   static void ThrowIfCheckedOutMoreThan(const RK_Stuff& s, int n) { s.ThrowIfCheckedOutMoreThan(n); }
   static void ThrowIfCheckedOutWriteable(const RK_Stuff& s) { s.ThrowIfCheckedOutWriteable(); }
@@ -29,8 +27,6 @@ class RK_TEST_Access {
     s.diskCacheFile = std::move(f);
   }
   static boost::weak_ptr<RK_SortDir>& SortDirLink(RK_Stuff& s) { return s.sortDir; }
-
-  // ---- RK_Bag ----
   static void AddStuffGuts(RK_Bag& b, boost::intrusive_ptr<RK_Stuff> s) { b.AddStuffGuts(std::move(s)); }
   static void RemoveStuffGuts(RK_Bag& b, RK_Stuff* s) { b.RemoveStuffGuts(s); }
   static std::uint32_t LockHoldCount(const RK_Bag& b) { return b.lockHoldCount; }
@@ -40,8 +36,6 @@ class RK_TEST_Access {
     RK_ScCacheLock lock;
     return std::vector<RK_Stuff*>(b.stuffByLastUse.begin(), b.stuffByLastUse.end());
   }
-
-  // ---- RK_SortDir ----
   // The items of one GUID, in group order.
   static std::vector<RK_Stuff*> Group(const RK_SortDir& d, const RK_Stuff& key) {
     RK_ScCacheLock lock;

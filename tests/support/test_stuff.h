@@ -2,6 +2,7 @@
 // asked (and its death) in a journal that outlives it.
 #pragma once
 
+#include <algorithm>
 #include <atomic>
 #include <boost/intrusive_ptr.hpp>
 #include <functional>
@@ -18,10 +19,22 @@ namespace rktest {
 // Events done to test items, in order. Thread-safe.
 class Journal {
  public:
-  void Add(const std::string& event);
-  std::vector<std::string> Events() const;
-  int Count(const std::string& event) const;
-  void Clear();
+  void Add(const std::string& event) {
+    std::lock_guard<std::mutex> lock(mutex_);
+    events_.push_back(event);
+  }
+  std::vector<std::string> Events() const {
+    std::lock_guard<std::mutex> lock(mutex_);
+    return events_;
+  }
+  int Count(const std::string& event) const {
+    std::lock_guard<std::mutex> lock(mutex_);
+    return static_cast<int>(std::count(events_.begin(), events_.end(), event));
+  }
+  void Clear() {
+    std::lock_guard<std::mutex> lock(mutex_);
+    events_.clear();
+  }
 
  private:
   mutable std::mutex mutex_;
@@ -37,10 +50,12 @@ class TestStuff : public RK_Stuff {
   static boost::intrusive_ptr<TestStuff> Make(std::uint32_t size = 1000, bool inMemory = true,
                                               bool trackMemory = false,
                                               std::shared_ptr<Journal> journal = nullptr,
-                                              std::string name = "item");
+                                              std::string name = "item") {
+    return new TestStuff(size, inMemory, trackMemory, std::move(journal), std::move(name));
+  }
 
-  void SetInMemory(bool inMemory);             // adjusts the tracked bytes
-  void SetOnDisk(std::optional<bool> onDisk);  // nullopt: the base answer
+  void SetInMemory(bool inMemory);  // adjusts the tracked bytes
+  void SetOnDisk(std::optional<bool> onDisk) { onDisk_.store(onDisk ? (*onDisk ? 1 : 0) : -1); }
   void SetCanDiskCache(bool can) { canDiskCache_.store(can); }
   // Answers of IdenticalRequest / CanSatisfyRequest; default: the base's.
   void SetIdentical(std::function<bool(const RK_Stuff*)> f) { identical_ = std::move(f); }
@@ -50,30 +65,44 @@ class TestStuff : public RK_Stuff {
   const std::string& Name() const { return name_; }
   const std::shared_ptr<Journal>& GetJournal() const { return journal_; }
 
-  bool IdenticalRequest(const RK_Stuff* request) const override;
-  bool CanSatisfyRequest(const RK_Stuff* request) const override;
-  std::uint32_t GetSizeInBytes() override;
+  bool IdenticalRequest(const RK_Stuff* request) const override {
+    Note("IdenticalRequest");
+    return identical_ ? identical_(request) : RK_Stuff::IdenticalRequest(request);
+  }
+  bool CanSatisfyRequest(const RK_Stuff* request) const override {
+    Note("CanSatisfyRequest");
+    return canSatisfy_ ? canSatisfy_(request) : RK_Stuff::CanSatisfyRequest(request);
+  }
+  std::uint32_t GetSizeInBytes() override { return size_; }
   bool FreeMemory() override;
-  bool IsInMemory() override;
+  bool IsInMemory() override {
+    if (int code = throwIsInMemory_.load()) throw code;
+    return inMemory_.load();
+  }
   bool CanDiskCache() const override { return canDiskCache_.load(); }
-  bool IsOnDisk() const override;
-  void YourDiskCacheFileWasDeleted() const override;
+  bool IsOnDisk() const override {
+    const int forced = onDisk_.load();
+    return forced < 0 ? RK_Stuff::IsOnDisk() : forced == 1;
+  }
+  void YourDiskCacheFileWasDeleted() const override { Note("YourDiskCacheFileWasDeleted"); }
 
  protected:
   ~TestStuff() override;
 
  private:
-  void Note(const std::string& what) const;
+  void Note(const std::string& what) const {
+    if (journal_) journal_->Add(name_ + ":" + what);
+  }
 
   std::string name_;
   std::shared_ptr<Journal> journal_;
-  std::atomic<std::uint32_t> size_;
-  std::atomic<bool> inMemory_;
+  const std::uint32_t size_;
+  std::atomic<bool> inMemory_{false};
   std::atomic<int> onDisk_{-1};  // -1: base answer, 0 / 1: forced
   std::atomic<bool> canDiskCache_{false};
   std::atomic<bool> freeRefuses_{false};
   std::atomic<int> throwIsInMemory_{0};
-  bool trackMemory_;
+  const bool trackMemory_;
   std::atomic<std::uint64_t> tracked_{0};
   std::function<bool(const RK_Stuff*)> identical_;
   std::function<bool(const RK_Stuff*)> canSatisfy_;
