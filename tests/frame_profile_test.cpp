@@ -9,6 +9,7 @@
 #include "plinth/debug.h"
 #include "rkcache/rkcache.h"
 #include "rkcache/testing.h"
+#include "support/test_stuff.h"
 
 namespace {
 
@@ -78,4 +79,25 @@ TEST(FrameProfile, ScopesRecordAtOrAboveTheirVolumeIntoOneLogEach) {
   OpenEveryScope();
   EXPECT_EQ(LogsByName()["VX.render.RK_Stuff::Checkout"].count, 2u);
   EXPECT_THROW(RK_TEST_ProfileScope(8), std::invalid_argument);
+}
+
+TEST(FrameProfile, TheHitPathRecordsIntoItsScopes) {
+  RK_Birth(false);
+  plinth::debug::CodeProfilerManager& manager = plinth::debug::CodeProfilerManager::Get();
+  manager.SetConditionalProfiling(true);
+  manager.SetProfilingVolume(7);
+  auto item = rktest::TestStuff::Make();
+  item->AddToBagAndSortDir(RK_GlobalBag(), {});
+  {
+    RK_ScCheckout receipt;
+    ASSERT_EQ(receipt.FindAndCheckout(item.get(), RK_Checkout_ReadOnly), RK_CheckoutResult_CheckedOut);
+  }
+  manager.SetConditionalProfiling(false);
+  auto logs = LogsByName();
+  for (const char* name : {"VX.render.RK_SortDir::AddStuff", "VX.render.RK_SortDir::FindAndCheckout",
+                           "VX.render.RK_Stuff::Checkout", "VX.render.RK_Stuff::Checkin"})
+    EXPECT_EQ(logs[name].count, 1u) << name;
+  item.reset();
+  RK_StopAllAsyncWork();
+  RK_Death();
 }
